@@ -1,0 +1,95 @@
+/*
+ * libosttiff - the codec library of the pivlo framework: libtiff 4.5 plus the
+ * extensions the TIFF module calls.
+ *
+ * The extensions keep the module on 32-bit client procedures and 32-bit file
+ * positions: every offset and size crossing a client procedure is 32-bit, and
+ * anything libtiff asks for beyond 4 GiB fails as an I/O error instead of
+ * wrapping. libtiff's own memory comes from the C heap (libtiff 4.5 has no
+ * allocator hook); the host allocator procedures handed to
+ * TIFFClientOpenPivlo serve the blocks this layer allocates itself.
+ */
+#ifndef OSTTIFF_OSTTIFF_H
+#define OSTTIFF_OSTTIFF_H
+
+#include <stdint.h>
+#include <tiffio.h>
+
+#if defined(_WIN32)
+#  define OSTTIFF_API __declspec(dllexport)
+#else
+#  define OSTTIFF_API __attribute__((visibility("default")))
+#endif
+
+#ifdef __cplusplus
+extern "C" {
+#endif
+
+/* 32-bit client procedures; the first argument is the client data handed to
+ * TIFFClientOpenPivlo. Reads and writes return the bytes moved (negative on
+ * failure); a seek returns the new position or 0xFFFFFFFF on failure. */
+typedef int32_t (*PivloReadWriteProc)(void* client, void* buffer, int32_t byteCount);
+typedef uint32_t (*PivloSeekProc)(void* client, uint32_t offset, int whence);
+typedef int (*PivloCloseProc)(void* client);
+typedef uint32_t (*PivloSizeProc)(void* client);
+typedef int (*PivloMapProc)(void* client, void** base, uint32_t* size);
+typedef void (*PivloUnmapProc)(void* client, void* base, uint32_t size);
+
+typedef void* (*PivloAllocProc)(uint32_t byteCount);
+typedef void* (*PivloReallocProc)(void* block, uint32_t byteCount);
+typedef void (*PivloFreeProc)(void* block);
+
+/* The 32-bit seek's failure value. */
+#define PIVLO_SEEK_FAILED 0xFFFFFFFFu
+
+/* Opens a codec object over 32-bit client procedures (as TIFFClientOpen).
+ * Null map/unmap procedures mean "not mappable". Null on failure; the close
+ * procedure is called by TIFFClose only, never after a failed open. */
+OSTTIFF_API TIFF* TIFFClientOpenPivlo(const char* name, const char* mode, void* clientData,
+                                      PivloReadWriteProc readProc, PivloReadWriteProc writeProc,
+                                      PivloSeekProc seekProc, PivloCloseProc closeProc,
+                                      PivloSizeProc sizeProc, PivloMapProc mapProc,
+                                      PivloUnmapProc unmapProc, PivloAllocProc allocProc,
+                                      PivloReallocProc reallocProc, PivloFreeProc freeProc);
+
+/* The same with libtiff's open options (handlers, allocation cap). */
+OSTTIFF_API TIFF* TIFFClientOpenPivloExt(const char* name, const char* mode, void* clientData,
+                                         PivloReadWriteProc readProc,
+                                         PivloReadWriteProc writeProc, PivloSeekProc seekProc,
+                                         PivloCloseProc closeProc, PivloSizeProc sizeProc,
+                                         PivloMapProc mapProc, PivloUnmapProc unmapProc,
+                                         PivloAllocProc allocProc, PivloReallocProc reallocProc,
+                                         PivloFreeProc freeProc, TIFFOpenOptions* options);
+
+/* Client data handed to TIFFClientOpenPivlo (TIFFClientdata returns the
+ * layer's own record; never call TIFFSetClientdata on these objects). Null
+ * for a codec object not opened through TIFFClientOpenPivlo. */
+OSTTIFF_API void* TIFFClientdataPivlo(TIFF* tif);
+
+/* Context slot of the codec object: the module stores its job here after
+ * opening so that code holding only the codec object can find the job. */
+OSTTIFF_API void TIFFSetContextPivlo(TIFF* tif, void* context);
+OSTTIFF_API void* TIFFGetContextPivlo(TIFF* tif);
+
+/* Nonzero once a client procedure failed, a short write happened or a
+ * position beyond 32 bits was asked for. Sticky until the object is closed:
+ * libtiff does not check every I/O result, so writers check this after
+ * writing a directory. */
+OSTTIFF_API int TIFFIOFailedPivlo(TIFF* tif);
+
+/* 32-bit views of StripOffsets/TileOffsets and StripByteCounts/TileByteCounts
+ * of the current directory: 1 and the value, or 0 when the index is out of
+ * range or the value does not fit in 32 bits. */
+OSTTIFF_API int TIFFGetStrileOffset32(TIFF* tif, uint32_t strile, uint32_t* offset);
+OSTTIFF_API int TIFFGetStrileByteCount32(TIFF* tif, uint32_t strile, uint32_t* byteCount);
+
+/* Blocks of this layer from the host allocator handed to the codec object
+ * (the C heap when none was given). */
+OSTTIFF_API void* PivloMalloc(TIFF* tif, uint32_t byteCount);
+OSTTIFF_API void PivloFree(TIFF* tif, void* block);
+
+#ifdef __cplusplus
+}
+#endif
+
+#endif /* OSTTIFF_OSTTIFF_H */

@@ -1,0 +1,29 @@
+// Routing of the codec library's error and warning messages to the job's
+// message sinks.
+#pragma once
+
+#include <cstdarg>
+
+#include "zantiff/conversion_context.h"
+
+namespace zan {
+
+constexpr int CODEC_MESSAGE_CODE = -400;
+constexpr int MESSAGE_BUFFER_SIZE = 512;
+
+// Installs the module's handlers in the codec library for this job's sinks
+// and saves the handlers in force in savedErrorHandler/savedWarningHandler.
+// A job that has already redirected only has its sinks refreshed, so that the
+// handlers saved first are the ones put back.
+void RedirectCodecMessages(ConversionContext* ctx);
+
+// Puts back the handlers saved when this job redirected; nothing when the job
+// has no redirection in force (so a job that never opened anything leaves the
+// codec's handlers alone).
+void RestoreCodecMessages(ConversionContext* ctx);
+
+// The handlers, with the codec library's handler signature.
+void CodecErrorToHost(const char* module, const char* format, va_list args);
+void CodecWarningToHost(const char* module, const char* format, va_list args);
+
+}  // namespace zan

@@ -1,0 +1,23 @@
+// Binding a codec object to the job's source or destination.
+#pragma once
+
+#include "zantiff/conversion_context.h"
+
+namespace zan {
+
+// 1 when `tiff` holds a codec object bound to the source (at once when one is
+// already open or a page is described), 0 after a reported failure with
+// nothing left held.
+int OpenTIFFForReading(ConversionContext* ctx);
+
+// 1 when `tiff` holds a codec object bound to the destination (at once when
+// one is already open), 0 after a reported failure.
+int OpenTIFFForWriting(ConversionContext* ctx);
+
+// Releases the job's file record, if any.
+void ReleaseFileHandle(ConversionContext* ctx);
+
+// Closes the job's stream buffer, if any.
+void CloseStreamBuffer(ConversionContext* ctx);
+
+}  // namespace zan

@@ -1,0 +1,110 @@
+// The reference host's message routing and buffers.
+
+#include <gtest/gtest.h>
+
+#include <cstring>
+
+#include <string>
+
+#include "pivlo/pivlo.h"
+#include "support/test_host.h"
+
+namespace {
+
+using zantest::TestAllocator;
+using zantest::TestHost;
+
+TEST(HostMessages, EverySeverityReachesTheHostSink) {
+    TestHost host;
+    zanError(host.ctx(), "broken");
+    zanWarning(host.ctx(), "odd");
+    zanTrace(host.ctx(), "note", 1);
+    zanErrorV(host.ctx(), "Failed to set %s=%s\n", "Artist", "me");
+    ASSERT_EQ(host.messages.size(), 4u);
+    EXPECT_EQ(host.messages[0].severity, PIVLO_ERROR);
+    EXPECT_EQ(host.messages[1].severity, PIVLO_WARNING);
+    EXPECT_EQ(host.messages[2].severity, PIVLO_TRACE);
+    EXPECT_EQ(host.messages[2].level, 1);
+    EXPECT_EQ(host.messages[3].text, "Failed to set Artist=me\n");
+}
+
+TEST(HostMessages, FormattedErrorsAreNotCut) {
+    TestHost host;
+    const std::string big(5000, 'q');
+    zanErrorV(host.ctx(), "<%s>", big.c_str());
+    ASSERT_EQ(host.Errors().size(), 1u);
+    EXPECT_EQ(host.Errors()[0], "<" + big + ">");
+}
+
+TEST(HostMessages, WithoutASinkErrorsAndWarningsGoToStandardError) {
+    ConversionContext ctx;
+    pivloInitContext(&ctx);
+    testing::internal::CaptureStderr();
+    zanError(&ctx, "disk full");
+    zanWarning(&ctx, "odd tag");
+    zanTrace(&ctx, "dropped", 1);
+    const std::string err = testing::internal::GetCapturedStderr();
+    EXPECT_NE(err.find("disk full"), std::string::npos);
+    EXPECT_NE(err.find("odd tag"), std::string::npos);
+    EXPECT_EQ(err.find("dropped"), std::string::npos);
+}
+
+TEST(HostBuffers, InitialisedRecordIsEmptyWithHeapAllocators) {
+    ConversionContext ctx;
+    std::memset(&ctx, 0x5A, sizeof ctx);
+    pivloInitContext(&ctx);
+    EXPECT_EQ(ctx.state, 0u);
+    EXPECT_EQ(ctx.tiff, nullptr);
+    ASSERT_NE(ctx.allocProc, nullptr);
+    void* block = ctx.allocProc(0);
+    EXPECT_NE(block, nullptr);
+    void* grown = ctx.reallocProc(block, 100);
+    ASSERT_NE(grown, nullptr);
+    void* shrunk = ctx.reallocProc(grown, 0);
+    EXPECT_NE(shrunk, nullptr) << "a shrink to nothing keeps a block";
+    ctx.freeProc(shrunk);
+}
+
+TEST(HostBuffers, FrameBufferResetReleasesTheFrame) {
+    TestHost host;
+    host->frameData = TestAllocator::Alloc(128);
+    host->frameBufferSize = 128;
+    zanResetFrameBuffer(host.ctx());
+    EXPECT_EQ(host->frameData, nullptr);
+    EXPECT_EQ(host->frameBufferSize, 0u);
+    EXPECT_EQ(TestAllocator::LiveBlocks(), 0u);
+}
+
+TEST(HostBuffers, WorkBufferGrowsAndIsReleasedByTheReset) {
+    TestHost host;
+    void* small = pivloWorkBuffer(host.ctx(), 16);
+    ASSERT_NE(small, nullptr);
+    EXPECT_EQ(pivloWorkBuffer(host.ctx(), 8), small) << "big enough: kept";
+    void* big = pivloWorkBuffer(host.ctx(), 4096);
+    ASSERT_NE(big, nullptr);
+    EXPECT_EQ(TestAllocator::LiveBlocks(), 1u);
+    TestAllocator::FailNthCall(1);
+    EXPECT_EQ(pivloWorkBuffer(host.ctx(), 10000), nullptr);
+    EXPECT_EQ(TestAllocator::LiveBlocks(), 1u) << "a refused growth keeps the old buffer";
+    zanResetWorkBuffer(host.ctx());
+    EXPECT_EQ(TestAllocator::LiveBlocks(), 0u);
+    zanResetWorkBuffer(host.ctx());
+}
+
+TEST(HostBuffers, ReleaseContextFreesWhatTheJobHandedOver) {
+    TestHost host;
+    host->frameData = TestAllocator::Alloc(10);
+    host->iccProfile = TestAllocator::Alloc(10);
+    host->documentName = static_cast<char*>(TestAllocator::Alloc(10));
+    host->imageDescription = static_cast<char*>(TestAllocator::Alloc(10));
+    host->paletteRed = static_cast<uint16_t*>(TestAllocator::Alloc(6 * 16));
+    host->paletteGreen = host->paletteRed + 16;
+    host->paletteBlue = host->paletteRed + 32;
+    pivloWorkBuffer(host.ctx(), 10);
+    pivloReleaseContext(host.ctx());
+    EXPECT_EQ(TestAllocator::LiveBlocks(), 0u);
+    EXPECT_EQ(host->paletteBlue, nullptr);
+    pivloReleaseContext(host.ctx());
+}
+
+}  // namespace

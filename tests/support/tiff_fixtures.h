@@ -1,0 +1,76 @@
+// TIFF files made with libtiff for the tests, and temporary files.
+#pragma once
+
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include <tiffio.h>
+
+namespace zantest {
+
+using Bytes = std::vector<uint8_t>;
+
+// A file in the temporary directory, removed when the object goes.
+class TempFile {
+public:
+    explicit TempFile(const std::string& suffix = ".tif");
+    ~TempFile();
+    TempFile(const TempFile&) = delete;
+    TempFile& operator=(const TempFile&) = delete;
+    const std::string& path() const { return path_; }
+    const char* c_str() const { return path_.c_str(); }
+
+private:
+    std::string path_;
+};
+
+// What a fixture page looks like. Pixels follow PixelValue().
+struct PageSpec {
+    uint32_t width = 16;
+    uint32_t height = 8;
+    uint16_t samplesPerPixel = 1;
+    uint16_t bitsPerSample = 8;
+    uint16_t photometric = PHOTOMETRIC_MINISBLACK;
+    uint16_t compression = COMPRESSION_NONE;
+    uint16_t planar = PLANARCONFIG_CONTIG;
+    uint32_t rowsPerStrip = 0;  // 0: libtiff's default
+    uint32_t tileWidth = 0;     // nonzero: tiled
+    uint32_t tileHeight = 0;
+    std::vector<uint16_t> extraSamples;  // ExtraSamples values, written when not empty
+    std::string description;             // ImageDescription when not empty
+};
+
+struct FileSpec {
+    std::vector<PageSpec> pages{PageSpec{}};
+    bool bigEndian = false;
+    bool bigTiff = false;
+};
+
+// Deterministic sample value of (page, x, y, sample), masked to the depth.
+uint32_t PixelValue(uint32_t page, uint32_t x, uint32_t y, uint32_t sample, uint16_t bits);
+
+// Writes the file with libtiff to `path`.
+void WriteTiffFile(const std::string& path, const FileSpec& spec);
+// The same file as bytes.
+Bytes MakeTiff(const FileSpec& spec);
+// A file of `pages` pages of the default page spec.
+Bytes MakePages(int pages);
+
+// Writes the pages of `spec` into an open codec object (tags, pixels,
+// TIFFWriteDirectory for each page). False when libtiff refuses any step.
+bool WritePages(TIFF* tif, const FileSpec& spec, uint32_t firstPageIndex = 0);
+
+Bytes ReadFileBytes(const std::string& path);
+void WriteFileBytes(const std::string& path, const Bytes& bytes);
+
+// What libtiff sees in a TIFF: page count and, per page, size and pixels of
+// the first strip decoded. Reads from memory through a private client.
+struct DecodedPage {
+    uint32_t width = 0;
+    uint32_t height = 0;
+    Bytes pixels;  // every strip decoded, in order
+};
+std::vector<DecodedPage> DecodeWithLibtiff(const Bytes& tiff);
+
+}  // namespace zantest

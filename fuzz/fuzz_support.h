@@ -1,0 +1,28 @@
+// Shared pieces of the fuzz targets: a quiet job record and the ways of
+// handing fuzz input to the module as a source.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+
+#include "zantiff/conversion_context.h"
+
+namespace zanfuzz {
+
+// A host stream over the fuzz input, read in chunks of a chosen size.
+struct InputStream {
+    const uint8_t* data;
+    size_t size;
+    size_t position;
+    uint32_t chunk;  // largest piece one read delivers (0: no limit)
+};
+
+// A job record with the C-heap allocators and every message dropped.
+void InitQuietJob(ConversionContext* ctx);
+
+// Points the job's source at `input` as kind `selector % 4`: memory, file-like
+// callbacks with a seek, the stream buffer service without one, or a memory
+// source that a trickling chunk size does not affect.
+void UseInputAsSource(ConversionContext* ctx, InputStream* input, uint8_t selector);
+
+}  // namespace zanfuzz

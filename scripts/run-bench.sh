@@ -1,0 +1,40 @@
+#!/usr/bin/env bash
+# Runs every benchmark program and writes bench/RESULTS.md: each Module_X
+# case next to its reference case(s) Y_X measured in the same run, with the
+# ratio reference time / module time (above 1: the module is faster).
+# Usage: run-bench.sh BUILD
+set -euo pipefail
+build=${1:-build}
+here=$(cd "$(dirname "$0")/.." && pwd)
+out="$here/bench/RESULTS.md"
+csv=$(mktemp)
+trap 'rm -f "$csv"' EXIT
+
+for program in "$build"/bin/bench_*; do
+  [ -x "$program" ] || continue
+  echo "run-bench: $(basename "$program")" >&2
+  "$program" --benchmark_format=csv --benchmark_repetitions=3 \
+      --benchmark_report_aggregates_only=true 2>/dev/null | grep '_median' >>"$csv" || true
+done
+
+{
+  echo "# Benchmark results"
+  echo
+  echo "Recorded by \`make bench\` on $(date -u +%Y-%m-%d) — $(nproc) cores,"
+  echo "$(grep -m1 'model name' /proc/cpuinfo | cut -d: -f2 | sed 's/^ *//'), $(uname -sr)."
+  echo "Median of 3 repetitions; ratio = reference time / module time (above 1: the module is faster)."
+  echo
+  echo "| case | module (ms) | reference | reference (ms) | ratio |"
+  echo "|---|---|---|---|---|"
+  awk -F, '
+    { name=$1; gsub(/"/, "", name); sub(/_median$/, "", name); sub(/\/.*$/, "", name);
+      t=$3; unit=$5; gsub(/"/, "", unit);
+      if (unit == "ns") t /= 1e6; else if (unit == "us") t /= 1e3; else if (unit == "s") t *= 1e3;
+      split(name, parts, "_"); who=parts[1]; what=substr(name, length(who) + 2);
+      time[who "|" what] = t; if (who == "Module") cases[what] = 1; else refs[what] = refs[what] " " who }
+    END {
+      for (c in cases) { n = split(refs[c], r, " ");
+        for (i = 1; i <= n; i++) printf "| %s | %.3f | %s | %.3f | %.2f |\n",
+          c, time["Module|" c], r[i], time[r[i] "|" c], time[r[i] "|" c] / time["Module|" c] } }' "$csv" | sort
+} >"$out"
+cat "$out"

@@ -3,6 +3,8 @@
 
 #include "frame/io_procs.h"
 
+#include "frame/file_stream.h"
+
 #include <cstdint>
 #include <cstdio>
 #include <limits>
@@ -17,16 +19,6 @@ ConversionContext* Ctx(void* client) { return static_cast<ConversionContext*>(cl
 FileHandleRecord* FileOf(void* client) {
     return static_cast<FileHandleRecord*>(Ctx(client)->fileHandle);
 }
-
-#if defined(_WIN32)
-int SeekStream(FILE* f, int64_t offset, int whence) { return _fseeki64(f, offset, whence); }
-int64_t TellStream(FILE* f) { return _ftelli64(f); }
-#else
-int SeekStream(FILE* f, int64_t offset, int whence) {
-    return fseeko(f, static_cast<off_t>(offset), whence);
-}
-int64_t TellStream(FILE* f) { return static_cast<int64_t>(ftello(f)); }
-#endif
 
 // A stream position as the codec sees it: relative to the base offset, and
 // only when that fits in 32 bits (0xFFFFFFFF is the failure value).
@@ -85,10 +77,7 @@ uint32_t FileSeekProc(void* client, uint32_t offset, int whence) {
 uint32_t FileSizeProc(void* client) {
     FileHandleRecord* file = FileOf(client);
     if (!file || !file->stream) return 0;
-    const int64_t remembered = TellStream(file->stream);
-    if (remembered < 0 || SeekStream(file->stream, 0, SEEK_END) != 0) return 0;
-    const int64_t end = TellStream(file->stream);
-    SeekStream(file->stream, remembered, SEEK_SET);
+    const int64_t end = StreamSize(file->stream);
     if (end <= static_cast<int64_t>(file->baseOffset)) return 0;
     const int64_t size = end - file->baseOffset;
     return size > static_cast<int64_t>(std::numeric_limits<uint32_t>::max())

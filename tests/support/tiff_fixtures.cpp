@@ -6,6 +6,7 @@
 #include <cstring>
 #include <fstream>
 #include <iterator>
+#include <sstream>
 #include <stdexcept>
 
 namespace zantest {
@@ -192,6 +193,75 @@ std::vector<DecodedPage> DecodeWithLibtiff(const Bytes& tiff) {
     } while (TIFFReadDirectory(tif));
     TIFFClose(tif);
     return pages;
+}
+
+namespace {
+
+std::string PrintDirectory(TIFF* tif) {
+    FILE* text = std::tmpfile();
+    if (!text) return {};
+    TIFFPrintDirectory(tif, text, 0);
+    std::string out;
+    std::rewind(text);
+    char buffer[4096];
+    size_t n;
+    while ((n = std::fread(buffer, 1, sizeof buffer, text)) > 0) out.append(buffer, n);
+    std::fclose(text);
+    return out;
+}
+
+void ReadAllBlocks(TIFF* tif, PageDump* dump) {
+    const bool tiled = TIFFIsTiled(tif);
+    const tmsize_t size = tiled ? TIFFTileSize(tif) : TIFFStripSize(tif);
+    const uint32_t blocks = tiled ? TIFFNumberOfTiles(tif) : TIFFNumberOfStrips(tif);
+    if (size <= 0 || size > (256 << 20)) {
+        dump->dataComplete = false;
+        return;
+    }
+    std::vector<uint8_t> block(static_cast<size_t>(size));
+    for (uint32_t i = 0; i < blocks; ++i) {
+        const tmsize_t n = tiled ? TIFFReadEncodedTile(tif, i, block.data(), size)
+                                 : TIFFReadEncodedStrip(tif, i, block.data(), size);
+        if (n < 0) {
+            dump->dataComplete = false;
+            continue;
+        }
+        dump->data.insert(dump->data.end(), block.begin(), block.begin() + n);
+    }
+}
+
+}  // namespace
+
+PageDump DumpPage(const Bytes& tiff, uint32_t page) {
+    PageDump dump;
+    TempFile file;
+    WriteFileBytes(file.path(), tiff);
+    const TIFFErrorHandler previousError = TIFFSetErrorHandler(nullptr);
+    const TIFFErrorHandler previousWarning = TIFFSetWarningHandler(nullptr);
+    TIFF* tif = TIFFOpen(file.c_str(), "rc");
+    if (tif && TIFFSetDirectory(tif, page)) {
+        dump.ok = true;
+        dump.tags = PrintDirectory(tif);
+        ReadAllBlocks(tif, &dump);
+        uint64_t exif = 0;
+        if (TIFFGetField(tif, TIFFTAG_EXIFIFD, &exif) && TIFFReadEXIFDirectory(tif, exif))
+            dump.exifTags = PrintDirectory(tif);
+    }
+    if (tif) TIFFClose(tif);
+    TIFFSetErrorHandler(previousError);
+    TIFFSetWarningHandler(previousWarning);
+    return dump;
+}
+
+std::string WithoutLines(const std::string& text, const std::vector<std::string>& words) {
+    std::istringstream in(text);
+    std::string line, out;
+    while (std::getline(in, line)) {
+        bool drop = false;
+        for (const auto& w : words) drop = drop || line.find(w) != std::string::npos;
+        if (!drop) out += line + "\n";
+    }
+    return out;
 }
 
 }  // namespace zantest

@@ -73,4 +73,20 @@ struct DecodedPage {
 };
 std::vector<DecodedPage> DecodeWithLibtiff(const Bytes& tiff);
 
+// What libtiff reports of one page (0-based): TIFFPrintDirectory's text of
+// the image directory, then of its EXIF directory when it has one, and every
+// strip or tile decoded. `ok` is false when libtiff cannot open the file or
+// reach the page.
+struct PageDump {
+    bool ok = false;
+    std::string tags;
+    std::string exifTags;
+    Bytes data;
+    bool dataComplete = true;  // every strip or tile decoded
+};
+PageDump DumpPage(const Bytes& tiff, uint32_t page);
+
+// Lines of a TIFFPrintDirectory text, without those naming any of `words`.
+std::string WithoutLines(const std::string& text, const std::vector<std::string>& words);
+
 }  // namespace zantest

@@ -1,0 +1,560 @@
+// Copying TIFF directories between files at the file-structure level.
+//
+// A page is copied in two passes over its source directory. The first reads
+// every entry, checks types and counts, checks that every value, directory
+// and strip lies inside the source file, loads the strip offsets and byte
+// counts, and works out an upper bound of the destination size; nothing is
+// written unless the whole page can be copied. The second pass writes the
+// directory, its values and sub-directories, the new offsets array and the
+// image data, at the positions the layout gives:
+//
+//   P      the directory: N, N entries in source order, next-IFD offset 0
+//          values stored outside their entries, in entry order (an EXIF, GPS
+//          or Interoperability directory is laid out the same way at the
+//          place of its pointer entry), each at an even offset
+//          the new strip offsets array, when it does not fit in its entry
+//          the strips (or tiles) in index order, each at an even offset
+//
+// Values and strips pass through one fixed copy buffer, so no image data is
+// held in memory; the only blocks are the three arrays of strip numbers.
+
+#include "pageops/container_walker.h"
+
+#include <algorithm>
+#include <cstring>
+#include <limits>
+
+#include "frame/file_stream.h"
+#include "frame/host_memory.h"
+#include "pivlo/pivlo.h"
+
+namespace zan {
+
+// ---------------------------------------------------------------- byte order
+
+uint16_t ByteOrderAccess::Get16(const unsigned char* b) const {
+    return order_ == ByteOrder::Little ? zanGetUINT16Little(ctx_, b) : zanGetUINT16Big(ctx_, b);
+}
+uint32_t ByteOrderAccess::Get32(const unsigned char* b) const {
+    return order_ == ByteOrder::Little ? zanGetUINT32Little(ctx_, b) : zanGetUINT32Big(ctx_, b);
+}
+void ByteOrderAccess::Put16(uint16_t v, unsigned char* b) const {
+    if (order_ == ByteOrder::Little) zanMake2ByteIntLittle(ctx_, v, b);
+    else zanMake2ByteIntBig(ctx_, v, b);
+}
+void ByteOrderAccess::Put32(uint32_t v, unsigned char* b) const {
+    if (order_ == ByteOrder::Little) zanMake4ByteIntLittle(ctx_, v, b);
+    else zanMake4ByteIntBig(ctx_, v, b);
+}
+
+// ---------------------------------------------------------------- header, chain
+
+namespace {
+
+bool ReadAt(FILE* stream, uint64_t offset, void* buffer, size_t n) {
+    return SeekStream(stream, static_cast<int64_t>(offset), SEEK_SET) == 0 &&
+           std::fread(buffer, 1, n, stream) == n;
+}
+
+}  // namespace
+
+HeaderResult readTiffHeader(ConversionContext* ctx, FILE* stream, ByteOrder* order,
+                            uint32_t* firstIfd) {
+    unsigned char header[8];
+    if (std::fread(header, 1, sizeof header, stream) != sizeof header) return HeaderResult::NotTiff;
+    if ((header[0] != 'I' && header[0] != 'M') || header[1] != header[0]) return HeaderResult::NotTiff;
+    *order = header[0] == 'I' ? ByteOrder::Little : ByteOrder::Big;
+    const ByteOrderAccess access(ctx, *order);
+    if (access.Get16(header + 2) != 42) return HeaderResult::BadIdentifier;
+    *firstIfd = access.Get32(header + 4);
+    return HeaderResult::Ok;
+}
+
+bool skipIfd(ConversionContext* ctx, FILE* stream, uint32_t offset, ByteOrder order,
+             uint64_t fileSize, uint32_t* next, uint32_t* nextField) {
+    const ByteOrderAccess access(ctx, order);
+    unsigned char count[2];
+    if (uint64_t{offset} + 2 > fileSize || !ReadAt(stream, offset, count, 2)) return false;
+    const uint64_t field = uint64_t{offset} + 2 + 12u * uint64_t{access.Get16(count)};
+    unsigned char link[4];
+    if (field + 4 > fileSize || !ReadAt(stream, field, link, 4)) return false;
+    *next = access.Get32(link);
+    if (nextField) *nextField = static_cast<uint32_t>(field);
+    return true;
+}
+
+// ---------------------------------------------------------------- page copy
+
+namespace {
+
+constexpr uint16_t kStripOffsets = 273, kTileOffsets = 324;
+constexpr uint16_t kStripByteCounts = 279, kTileByteCounts = 325;
+constexpr uint16_t kNewSubfileType = 254, kPageNumber = 297;
+constexpr uint16_t kBitsPerSample = 258, kCompression = 259;
+constexpr uint16_t kExifIfd = 34665, kGpsIfd = 34853, kInteropIfd = 40965;
+constexpr uint16_t kShort = 3, kLong = 4, kDouble = 12, kIfd = 13;
+constexpr uint32_t kMaxOffset = std::numeric_limits<uint32_t>::max();
+
+// Values and strips pass through a buffer of this size (a multiple of every
+// value size, so that a chunk never splits a value).
+constexpr size_t kCopyBufferSize = 64 * 1024;
+
+// Kind of directory being copied: the page itself, or one its pointer
+// entries lead to (EXIF and GPS from the page, Interoperability from EXIF).
+enum class DirKind { Page, Exif, Gps, Interop };
+
+uint64_t Even(uint64_t position) { return position + (position & 1); }
+
+// Size in bytes of one value of a field type; 0 for types the walker does
+// not accept.
+uint32_t TypeSize(uint16_t type, bool acceptIfdType) {
+    switch (type) {
+    case 1: case 2: case 6: case 7: return 1;
+    case 3: case 8: return 2;
+    case 4: case 9: case 11: return 4;
+    case 5: case 10: case 12: return 8;
+    case 13: return acceptIfdType ? 4 : 0;
+    default: return 0;
+    }
+}
+
+// Width of the numbers a type's values are converted by: 2 or 4 bytes (a
+// RATIONAL is two 4-byte numbers); 0 for bytes, which need no conversion.
+uint32_t ConversionUnit(uint16_t type) {
+    switch (type) {
+    case 3: case 8: return 2;
+    case 4: case 5: case 9: case 10: case 11: case 13: return 4;
+    default: return 0;
+    }
+}
+
+struct Entry {
+    unsigned char raw[12];
+    uint16_t tag = 0;
+    uint16_t type = 0;
+    uint32_t count = 0;
+    uint64_t byteSize = 0;  // count x type size
+    uint32_t value = 0;     // the value field as a number (an offset when byteSize > 4)
+};
+
+// An array of 32-bit numbers from the job's allocator.
+class NumberArray {
+public:
+    explicit NumberArray(ConversionContext* ctx) : ctx_(ctx) {}
+    NumberArray(const NumberArray&) = delete;
+    NumberArray& operator=(const NumberArray&) = delete;
+    ~NumberArray() { ReleaseBlock(ctx_, data_); }
+    bool Allocate(uint32_t count) {
+        if (count > kMaxOffset / 4) return false;
+        data_ = static_cast<uint32_t*>(AllocateBlock(ctx_, count ? count * 4 : 4));
+        return data_ != nullptr;
+    }
+    bool present() const { return data_ != nullptr; }
+    uint32_t& operator[](uint32_t i) { return data_[i]; }
+
+private:
+    ConversionContext* ctx_;
+    uint32_t* data_ = nullptr;
+};
+
+class PageCopier {
+public:
+    PageCopier(ConversionContext* ctx, FILE* source, uint64_t sourceSize, ByteOrder sourceOrder,
+               FILE* dest, ByteOrder destOrder, const PageCopyOptions& options)
+        : ctx_(ctx), source_(source), sourceSize_(sourceSize), in_(ctx, sourceOrder),
+          dest_(dest), out_(ctx, destOrder), options_(options), offsets_(ctx),
+          byteCounts_(ctx), newOffsets_(ctx) {}
+
+    int Copy(uint32_t ifd, uint32_t position, PageCopyResult* result) {
+        uint64_t bound = position;
+        if (!Inspect(ifd, DirKind::Page, &bound)) return 0;
+        if (bound > kMaxOffset) return Fail("Destination would exceed 4 GiB.");
+        data_ = position;
+        if (!WriteDirectory(ifd, position, DirKind::Page, result)) return 0;
+        if (std::fflush(dest_) != 0) return Fail("Unable to write to destination file.");
+        result->dataEnd = static_cast<uint32_t>(data_);
+        return 1;
+    }
+
+private:
+    // ------------------------------------------------------------ checking
+
+    int Fail(const char* message) {
+        zanError(ctx_, message);
+        return 0;
+    }
+
+    bool ReadEntry(uint32_t ifd, uint32_t index, Entry* e) {
+        if (!ReadAt(source_, uint64_t{ifd} + 2 + 12u * uint64_t{index}, e->raw, 12)) return false;
+        e->tag = in_.Get16(e->raw);
+        e->type = in_.Get16(e->raw + 2);
+        e->count = in_.Get32(e->raw + 4);
+        e->byteSize = uint64_t{e->count} * TypeSize(e->type, options_.acceptIfdType);
+        e->value = in_.Get32(e->raw + 8);
+        return true;
+    }
+
+    bool ReadCount(uint32_t ifd, uint16_t* count) {
+        unsigned char bytes[2];
+        if (uint64_t{ifd} + 2 > sourceSize_ || !ReadAt(source_, ifd, bytes, 2)) return false;
+        *count = in_.Get16(bytes);
+        return uint64_t{ifd} + 2 + 12u * uint64_t{*count} + 4 <= sourceSize_;
+    }
+
+    static bool IsOffsets(const Entry& e) { return e.tag == kStripOffsets || e.tag == kTileOffsets; }
+    static bool IsByteCounts(const Entry& e) {
+        return e.tag == kStripByteCounts || e.tag == kTileByteCounts;
+    }
+
+    // The directory an entry of a `kind` directory points to, if the entry
+    // is such a pointer.
+    bool SubDirectoryOf(DirKind kind, const Entry& e, DirKind* sub) const {
+        if (e.count != 1 || (e.type != kLong && e.type != kIfd) || e.value == 0) return false;
+        if (kind == DirKind::Page && e.tag == kExifIfd) *sub = DirKind::Exif;
+        else if (kind == DirKind::Page && e.tag == kGpsIfd) *sub = DirKind::Gps;
+        else if (kind == DirKind::Exif && e.tag == kInteropIfd) *sub = DirKind::Interop;
+        else return false;
+        return true;
+    }
+
+    // Loads the strip offsets or byte counts of `e` into `array`: from the
+    // entry when they fit in it, else from the source, widened to 32 bits.
+    bool LoadStripNumbers(const Entry& e, NumberArray& array, uint64_t* total) {
+        if (!array.Allocate(stripCount_)) return Fail("Memory allocation error.");
+        const uint32_t width = e.type == kShort ? 2 : 4;
+        if (e.byteSize <= 4) {
+            for (uint32_t i = 0; i < e.count && i < 4 / width; ++i)
+                array[i] = width == 2 ? in_.Get16(e.raw + 8 + 2 * i) : in_.Get32(e.raw + 8);
+        } else {
+            unsigned char chunk[kCopyBufferSize];
+            for (uint32_t i = 0; i < e.count;) {
+                const uint32_t n = std::min<uint32_t>(e.count - i, kCopyBufferSize / width);
+                if (!ReadAt(source_, uint64_t{e.value} + uint64_t{i} * width, chunk, n * width))
+                    return Fail("Source value lies beyond the end of the file.");
+                for (uint32_t k = 0; k < n; ++k, ++i)
+                    array[i] = width == 2 ? in_.Get16(chunk + 2 * k) : in_.Get32(chunk + 4 * k);
+            }
+        }
+        if (total)
+            for (uint32_t i = 0; i < e.count; ++i) *total += array[i];
+        return true;
+    }
+
+    // The strip-count rule shared by offsets and byte counts: the first of
+    // the two entries sets the count, the second must agree.
+    bool TakeStripCount(const Entry& e, const char* mismatch) {
+        if (stripCountKnown_ && e.count != stripCount_) return Fail(mismatch);
+        stripCount_ = e.count;
+        stripCountKnown_ = true;
+        if (e.type != kShort && e.type != kLong) return Fail("Unhandled TIFF value type.");
+        return true;
+    }
+
+    bool InspectStripEntry(const Entry& e) {
+        if (IsOffsets(e)) {
+            if (!TakeStripCount(e, "Source num of strips and num of strip size do not match."))
+                return false;
+            if (offsets_.present()) return Fail("Strip and Tile offsets both present.");
+            offsetsType_ = e.type;
+            offsetsByteSize_ = e.byteSize;
+            return LoadStripNumbers(e, offsets_, nullptr);
+        }
+        if (!TakeStripCount(e, "Source num of strips and num of stripsize do not match."))
+            return false;
+        if (byteCounts_.present()) return Fail("Strip and Tile byte counts both present.");
+        return LoadStripNumbers(e, byteCounts_, &totalBytes_);
+    }
+
+    // Checks the strips once both arrays are known, and adds the offsets
+    // array and the image data to the size bound.
+    bool InspectStrips(uint64_t* bound) {
+        if (offsets_.present() != byteCounts_.present())
+            return Fail(offsets_.present() ? "Source page has strip offsets but no byte counts."
+                                           : "Source page has strip byte counts but no offsets.");
+        if (!offsets_.present()) return true;
+        for (uint32_t i = 0; i < stripCount_; ++i)
+            if (uint64_t{offsets_[i]} + byteCounts_[i] > sourceSize_)
+                return Fail("Source strip data lie beyond the end of the file.");
+        if (!newOffsets_.Allocate(stripCount_)) return Fail("Memory allocation error.");
+        *bound += 4 * uint64_t{stripCount_} + 1 + totalBytes_ + stripCount_;
+        return true;
+    }
+
+    // First pass over a directory: every check, no writing.
+    bool Inspect(uint32_t ifd, DirKind kind, uint64_t* bound) {
+        uint16_t count = 0;
+        if (!ReadCount(ifd, &count)) return Fail("Source directory lies beyond the end of the file.");
+        *bound = Even(*bound) + 2 + 12u * uint64_t{count} + 4;
+        for (uint32_t i = 0; i < count; ++i) {
+            Entry e;
+            if (!ReadEntry(ifd, i, &e)) return Fail("Source directory lies beyond the end of the file.");
+            if (TypeSize(e.type, options_.acceptIfdType) == 0) return Fail("Unhandled TIFF TYPE.");
+            if (kind == DirKind::Page && (IsOffsets(e) || IsByteCounts(e)) && !InspectStripEntry(e))
+                return false;
+            if (kind == DirKind::Page && !NoteSampleLayout(e)) return false;
+            DirKind sub;
+            if (e.byteSize <= 4 && SubDirectoryOf(kind, e, &sub)) {
+                if (!Inspect(e.value, sub, bound)) return false;
+            } else if (e.byteSize > 4 && !(kind == DirKind::Page && IsOffsets(e))) {
+                if (uint64_t{e.value} + e.byteSize > sourceSize_)
+                    return Fail("Source value lies beyond the end of the file.");
+                if (options_.convertByteOrder && e.type == kDouble) return Fail("Unhandled type.");
+                *bound = Even(*bound) + e.byteSize;
+            }
+        }
+        return kind != DirKind::Page || (InspectStrips(bound) && ChooseSampleSwap());
+    }
+
+    // Remembers the page's BitsPerSample (all values must agree when they
+    // are wide) and Compression.
+    bool NoteSampleLayout(const Entry& e) {
+        if (e.tag == kCompression && e.type == kShort && e.count == 1) {
+            compression_ = in_.Get16(e.raw + 8);
+        } else if (e.tag == kBitsPerSample && e.type == kShort && e.count > 0) {
+            NumberArray bits(ctx_);
+            const uint32_t saved = stripCount_;
+            stripCount_ = e.count;  // LoadStripNumbers sizes its array by the strip count
+            const bool loaded = LoadStripNumbers(e, bits, nullptr);
+            stripCount_ = saved;
+            if (!loaded) return false;
+            bitsPerSample_ = bits[0];
+            for (uint32_t i = 1; i < e.count; ++i)
+                if (bits[i] != bits[0]) mixedBits_ = true;
+        }
+        return true;
+    }
+
+    // Samples of 16, 24, 32 and 64 bits (and 128-bit complex samples, as two
+    // 64-bit halves) are stored in the file's byte order, as readers swap
+    // them. Changing the order swaps them in uncompressed data; compressed
+    // data would have to be decoded, so such a page is refused.
+    bool ChooseSampleSwap() {
+        if (!options_.convertByteOrder || in_.order() == out_.order()) return true;
+        uint32_t unit = 0;
+        switch (bitsPerSample_) {
+        case 16: unit = 2; break;
+        case 24: unit = 3; break;
+        case 32: unit = 4; break;
+        case 64: case 128: unit = 8; break;
+        default: return true;
+        }
+        if (compression_ != 1 || mixedBits_)
+            return Fail("Page samples of more than 8 bits cannot change byte order without decoding.");
+        sampleSwapUnit_ = unit;
+        return true;
+    }
+
+    // ------------------------------------------------------------ writing
+
+    bool WriteAt(uint64_t position, const void* data, size_t n) {
+        if (SeekStream(dest_, static_cast<int64_t>(position), SEEK_SET) != 0 ||
+            std::fwrite(data, 1, n, dest_) != n)
+            return Fail("Unable to write to destination file.");
+        return true;
+    }
+
+    // Converts whole values of `type` in `bytes` from the source order into
+    // the destination order.
+    void ConvertValues(uint16_t type, unsigned char* bytes, size_t n) const {
+        const uint32_t unit = ConversionUnit(type);
+        if (!options_.convertByteOrder || unit == 0 || in_.order() == out_.order()) return;
+        for (size_t i = 0; i + unit <= n; i += unit) {
+            if (unit == 2) out_.Put16(in_.Get16(bytes + i), bytes + i);
+            else out_.Put32(in_.Get32(bytes + i), bytes + i);
+        }
+    }
+
+    // Reverses the bytes of every `unit`-byte sample.
+    static void SwapSamples(unsigned char* bytes, size_t n, uint32_t unit) {
+        for (size_t i = 0; i + unit <= n; i += unit) std::reverse(bytes + i, bytes + i + unit);
+    }
+
+    // Copies n bytes from `from` in the source to the data position,
+    // converted as values of `type` (bytes when type is 0), or as image
+    // samples of `sampleUnit` bytes (0: copied as they are).
+    bool CopyData(uint64_t from, uint64_t n, uint16_t type, uint32_t sampleUnit = 0) {
+        unsigned char buffer[kCopyBufferSize];
+        // A chunk holds whole samples, so that none is split between chunks.
+        const size_t chunkSize = sampleUnit > 1 ? sizeof buffer / sampleUnit * sampleUnit : sizeof buffer;
+        if (SeekStream(dest_, static_cast<int64_t>(data_), SEEK_SET) != 0)
+            return Fail("Unable to write to destination file.");
+        if (SeekStream(source_, static_cast<int64_t>(from), SEEK_SET) != 0)
+            return Fail("Error reading the source file.");
+        for (uint64_t done = 0; done < n;) {
+            const size_t chunk = static_cast<size_t>(std::min<uint64_t>(n - done, chunkSize));
+            if (std::fread(buffer, 1, chunk, source_) != chunk)
+                return Fail("Error reading the source file.");
+            ConvertValues(type, buffer, chunk);
+            if (sampleUnit > 1) SwapSamples(buffer, chunk, sampleUnit);
+            if (std::fwrite(buffer, 1, chunk, dest_) != chunk)
+                return Fail("Unable to write to destination file.");
+            done += chunk;
+        }
+        data_ = Even(data_ + n);
+        return true;
+    }
+
+    // Tag, type and count of an entry in the destination order.
+    void PutEntryHead(const Entry& e, uint16_t type, unsigned char* raw) const {
+        std::memcpy(raw, e.raw, 12);
+        if (!options_.convertByteOrder) {
+            if (type != e.type) out_.Put16(type, raw + 2);
+            return;
+        }
+        out_.Put16(e.tag, raw);
+        out_.Put16(type, raw + 2);
+        out_.Put32(e.count, raw + 4);
+    }
+
+    // The entry of a value that lies inside it, as the destination gets it.
+    void InlineEntry(const Entry& e, DirKind kind, unsigned char* raw) const {
+        PutEntryHead(e, e.type, raw);
+        if (kind == DirKind::Page && options_.markStandalone) {
+            if (e.tag == kNewSubfileType) {
+                std::memset(raw + 8, 0, 4);
+                return;
+            }
+            if (e.tag == kPageNumber && e.type == kShort) {
+                out_.Put16(0, raw + 8);
+                out_.Put16(1, raw + 10);
+                return;
+            }
+        }
+        if (!options_.convertByteOrder) return;
+        const uint32_t unit = ConversionUnit(e.type);
+        if (unit == 2) {
+            out_.Put16(in_.Get16(e.raw + 8), raw + 8);
+            if (e.byteSize == 4) out_.Put16(in_.Get16(e.raw + 10), raw + 10);
+        } else if (unit == 4 && e.byteSize == 4) {
+            out_.Put32(e.value, raw + 8);
+        }
+    }
+
+    // Writes the directory at `ifd` to `at` (even) with everything it holds;
+    // data_ must lie at or behind the directory's end.
+    bool WriteDirectory(uint32_t ifd, uint32_t at, DirKind kind, PageCopyResult* result) {
+        uint16_t count = 0;
+        if (!ReadCount(ifd, &count)) return Fail("Error reading the source file.");
+        unsigned char head[2];
+        out_.Put16(count, head);
+        if (!WriteAt(at, head, 2)) return false;
+        const uint64_t entriesAt = uint64_t{at} + 2;
+        data_ = std::max<uint64_t>(data_, entriesAt + 12u * uint64_t{count} + 4);
+        Entry offsetsEntry;
+        uint64_t offsetsSlot = 0;
+        for (uint32_t i = 0; i < count; ++i) {
+            Entry e;
+            if (!ReadEntry(ifd, i, &e)) return Fail("Error reading the source file.");
+            const uint64_t slot = entriesAt + 12u * uint64_t{i};
+            unsigned char raw[12];
+            DirKind sub;
+            if (kind == DirKind::Page && IsOffsets(e)) {
+                offsetsEntry = e;
+                offsetsSlot = slot;
+                continue;  // filled in once the strips have their places
+            }
+            if (e.byteSize <= 4 && SubDirectoryOf(kind, e, &sub)) {
+                const uint64_t subAt = Even(data_);
+                data_ = subAt;
+                if (!WriteDirectory(e.value, static_cast<uint32_t>(subAt), sub, nullptr)) return false;
+                PutEntryHead(e, e.type, raw);
+                out_.Put32(static_cast<uint32_t>(subAt), raw + 8);
+            } else if (e.byteSize <= 4) {
+                InlineEntry(e, kind, raw);
+            } else {
+                const uint64_t valueAt = data_;
+                if (!CopyData(e.value, e.byteSize, e.type)) return false;
+                PutEntryHead(e, e.type, raw);
+                out_.Put32(static_cast<uint32_t>(valueAt), raw + 8);
+            }
+            if (!WriteAt(slot, raw, 12)) return false;
+        }
+        const uint64_t nextField = entriesAt + 12u * uint64_t{count};
+        const unsigned char end[4] = {0, 0, 0, 0};
+        if (!WriteAt(nextField, end, 4)) return false;
+        if (kind != DirKind::Page) return true;
+
+        unsigned char link[4];
+        if (!ReadAt(source_, uint64_t{ifd} + 2 + 12u * uint64_t{count}, link, 4))
+            return Fail("Error reading the source file.");
+        result->nextIfd = in_.Get32(link);
+        result->nextIfdField = static_cast<uint32_t>(nextField);
+        return !offsets_.present() || WriteStrips(offsetsEntry, offsetsSlot);
+    }
+
+    // Copies the strips to the data area and writes the offsets entry (and
+    // array) pointing at their new places. SHORT offsets become LONG when the
+    // new ones might not fit in 16 bits.
+    bool WriteStrips(const Entry& e, uint64_t slot) {
+        uint16_t type = offsetsType_;
+        uint64_t byteSize = offsetsByteSize_;
+        if (type == kShort && data_ + 4 * (uint64_t{stripCount_} + 128) + totalBytes_ > 65535) {
+            type = kLong;
+            byteSize *= 2;
+        }
+        const uint64_t arrayAt = data_;
+        if (byteSize > 4) data_ = Even(data_ + byteSize);
+        for (uint32_t i = 0; i < stripCount_; ++i) {
+            newOffsets_[i] = static_cast<uint32_t>(data_);
+            if (!CopyData(offsets_[i], byteCounts_[i], 0, sampleSwapUnit_)) return false;
+        }
+        unsigned char raw[12];
+        PutEntryHead(e, type, raw);
+        const uint32_t width = type == kShort ? 2 : 4;
+        if (byteSize > 4) {
+            out_.Put32(static_cast<uint32_t>(arrayAt), raw + 8);
+            if (!WriteAt(slot, raw, 12)) return false;
+            return WriteOffsetsArray(arrayAt, width);
+        }
+        for (uint32_t i = 0; i < stripCount_ && i < 4 / width; ++i) {
+            if (width == 2) out_.Put16(static_cast<uint16_t>(newOffsets_[i]), raw + 8 + 2 * i);
+            else out_.Put32(newOffsets_[i], raw + 8);
+        }
+        return WriteAt(slot, raw, 12);
+    }
+
+    bool WriteOffsetsArray(uint64_t at, uint32_t width) {
+        unsigned char buffer[kCopyBufferSize];
+        for (uint32_t i = 0; i < stripCount_;) {
+            const uint32_t n = std::min<uint32_t>(stripCount_ - i, kCopyBufferSize / width);
+            for (uint32_t k = 0; k < n; ++k) {
+                if (width == 2) out_.Put16(static_cast<uint16_t>(newOffsets_[i + k]), buffer + 2 * k);
+                else out_.Put32(newOffsets_[i + k], buffer + 4 * k);
+            }
+            if (!WriteAt(at + uint64_t{i} * width, buffer, n * width)) return false;
+            i += n;
+        }
+        return true;
+    }
+
+    ConversionContext* ctx_;
+    FILE* source_;
+    uint64_t sourceSize_;
+    ByteOrderAccess in_;
+    FILE* dest_;
+    ByteOrderAccess out_;
+    PageCopyOptions options_;
+
+    NumberArray offsets_, byteCounts_, newOffsets_;
+    uint32_t stripCount_ = 0;
+    bool stripCountKnown_ = false;
+    uint16_t offsetsType_ = 0;
+    uint64_t offsetsByteSize_ = 0;
+    uint64_t totalBytes_ = 0;
+    uint64_t data_ = 0;  // next free destination offset (D)
+    uint32_t compression_ = 1;      // Compression of the page (1 when absent)
+    uint32_t bitsPerSample_ = 1;    // first BitsPerSample value (1 when absent)
+    bool mixedBits_ = false;        // BitsPerSample values differ
+    uint32_t sampleSwapUnit_ = 0;   // bytes per image sample to reverse (0: none)
+};
+
+}  // namespace
+
+int copyTiffPage(ConversionContext* ctx, FILE* source, uint64_t sourceSize, uint32_t ifd,
+                 ByteOrder sourceOrder, FILE* dest, uint32_t position, ByteOrder destOrder,
+                 const PageCopyOptions& options, PageCopyResult* result) {
+    PageCopier copier(ctx, source, sourceSize, sourceOrder, dest, destOrder, options);
+    return copier.Copy(ifd, position, result);
+}
+
+}  // namespace zan

@@ -65,3 +65,31 @@ void UseInputAsSource(ConversionContext* ctx, InputStream* input, uint8_t select
 }
 
 }  // namespace zanfuzz
+
+namespace zanfuzz {
+
+std::vector<uint8_t> TinyTiff() {
+    // Header, 8 bytes of pixels at 8, then the directory at 16.
+    std::vector<uint8_t> t = {'I', 'I', 42, 0, 16, 0, 0, 0, 1, 2, 3, 4, 5, 6, 7, 8};
+    const uint16_t entries[][2] = {{256, 4}, {257, 2}, {258, 8}, {262, 1}, {273, 8}, {278, 2}, {279, 8}};
+    auto put16 = [&](uint16_t v) { t.push_back(v & 0xFF); t.push_back(v >> 8); };
+    auto put32 = [&](uint32_t v) { put16(v & 0xFFFF); put16(v >> 16); };
+    put16(7);
+    for (const auto& e : entries) {
+        put16(e[0]);
+        put16(3);  // SHORT
+        put32(1);
+        put32(e[1]);
+    }
+    put32(0);
+    return t;
+}
+
+FILE* TemporaryStream(const std::vector<uint8_t>& bytes) {
+    FILE* f = std::tmpfile();
+    if (f && !bytes.empty()) std::fwrite(bytes.data(), 1, bytes.size(), f);
+    if (f) std::rewind(f);
+    return f;
+}
+
+}  // namespace zanfuzz

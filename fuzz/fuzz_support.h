@@ -4,6 +4,8 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <cstdio>
+#include <vector>
 
 #include "zantiff/conversion_context.h"
 
@@ -24,5 +26,15 @@ void InitQuietJob(ConversionContext* ctx);
 // callbacks with a seek, the stream buffer service without one, or a memory
 // source that a trickling chunk size does not affect.
 void UseInputAsSource(ConversionContext* ctx, InputStream* input, uint8_t selector);
+
+}  // namespace zanfuzz
+
+namespace zanfuzz {
+
+// A small valid one-page TIFF (grey 4x2, little-endian).
+std::vector<uint8_t> TinyTiff();
+
+// A read-write stream in the temporary directory holding `bytes`.
+FILE* TemporaryStream(const std::vector<uint8_t>& bytes);
 
 }  // namespace zanfuzz

@@ -5,7 +5,7 @@ set -euo pipefail
 build=${1:-build-fuzz}
 seconds=${2:-30}
 here=$(cd "$(dirname "$0")/.." && pwd)
-seeds=()
+seeds=("$here/fuzz/regressions")
 [ -d "$here/samples" ] && seeds+=("$here/samples")
 corpus=${ZANTIFF_CORPUS:-$here/../shared/corpus}
 [ -d "$corpus" ] && seeds+=("$corpus")
@@ -14,6 +14,11 @@ for target in "$build"/bin/fuzz_*; do
   [ -x "$target" ] || continue
   name=$(basename "$target")
   work=$(mktemp -d)
+  # Inputs that once failed come first, then a timed run over all the seeds.
+  if [ -d "$here/fuzz/regressions/$name" ] && ! "$target" "$here/fuzz/regressions/$name"/* >"$work.log" 2>&1; then
+    tail -n 60 "$work.log"
+    status=1
+  fi
   echo "fuzz-smoke: $name for ${seconds}s"
   if ! "$target" "$work" "${seeds[@]}" -max_total_time="$seconds" -timeout=20 \
        -rss_limit_mb=2048 -print_final_stats=1 >"$work.log" 2>&1; then

@@ -36,5 +36,12 @@ done
       for (c in cases) { n = split(refs[c], r, " ");
         for (i = 1; i <= n; i++) printf "| %s | %.3f | %s | %.3f | %.2f |\n",
           c, time["Module|" c], r[i], time[r[i] "|" c], time[r[i] "|" c] / time["Module|" c] } }' "$csv" | sort
+  echo
+  echo "## File-level page operations (commands, wall time)"
+  echo
+  echo "The zantiff tool against libtiff's tools and a plain copy of the same bytes;"
+  echo "ratio = reference time / zantiff time. Peak memory is the peak RSS of the process."
+  echo
+  "$here/bench/pageops.sh" "$build" 5
 } >"$out"
 cat "$out"

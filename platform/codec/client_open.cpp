@@ -66,9 +66,13 @@ tmsize_t Transfer(Adapter* a, PivloReadWriteProc proc, void* buffer, tmsize_t n)
     return done;
 }
 
+// A failed read delivers nothing: parts of libtiff treat a negative count as
+// impossible (an old-style JPEG reader asserts on it), and every caller
+// takes fewer bytes than asked for as a failure.
 tmsize_t ReadThunk(thandle_t h, void* buffer, tmsize_t n) {
     Adapter* a = AdapterOf(h);
-    return Transfer(a, a->read, buffer, n);
+    const tmsize_t got = Transfer(a, a->read, buffer, n);
+    return got < 0 ? 0 : got;
 }
 
 tmsize_t WriteThunk(thandle_t h, void* buffer, tmsize_t n) {

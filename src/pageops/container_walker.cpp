@@ -75,9 +75,18 @@ bool skipIfd(ConversionContext* ctx, FILE* stream, uint32_t offset, ByteOrder or
     const ByteOrderAccess access(ctx, order);
     unsigned char count[2];
     if (uint64_t{offset} + 2 > fileSize || !ReadAt(stream, offset, count, 2)) return false;
-    const uint64_t field = uint64_t{offset} + 2 + 12u * uint64_t{access.Get16(count)};
+    const uint32_t entryBytes = 12u * access.Get16(count);
+    const uint64_t field = uint64_t{offset} + 2 + entryBytes;
+    if (field + 4 > fileSize) return false;
+    // The entries of a usual directory are read over rather than sought
+    // past: they are in the stream's buffer already, and a seek would
+    // empty it.
+    unsigned char entries[4096];
+    const bool skipped = entryBytes <= sizeof entries
+                             ? std::fread(entries, 1, entryBytes, stream) == entryBytes
+                             : SeekStream(stream, static_cast<int64_t>(field), SEEK_SET) == 0;
     unsigned char link[4];
-    if (field + 4 > fileSize || !ReadAt(stream, field, link, 4)) return false;
+    if (!skipped || std::fread(link, 1, 4, stream) != 4) return false;
     *next = access.Get32(link);
     if (nextField) *nextField = static_cast<uint32_t>(field);
     return true;
@@ -86,6 +95,43 @@ bool skipIfd(ConversionContext* ctx, FILE* stream, uint32_t offset, ByteOrder or
 // ---------------------------------------------------------------- page copy
 
 namespace {
+
+// A file stream that knows its position, so that reads and writes which
+// continue where the last one ended need no seek (a seek empties the stream's
+// buffer). Strips stored one after another then copy as one stream.
+class TrackedStream {
+public:
+    explicit TrackedStream(FILE* stream) : stream_(stream) {}
+
+    bool Read(uint64_t at, void* buffer, size_t n) {
+        return MoveTo(at) && Done(std::fread(buffer, 1, n, stream_), n);
+    }
+    bool Write(uint64_t at, const void* data, size_t n) {
+        return MoveTo(at) && Done(std::fwrite(data, 1, n, stream_), n);
+    }
+
+private:
+    static constexpr uint64_t kUnknown = ~uint64_t{0};
+
+    bool MoveTo(uint64_t at) {
+        if (at == position_) return true;
+        position_ = kUnknown;
+        if (SeekStream(stream_, static_cast<int64_t>(at), SEEK_SET) != 0) return false;
+        position_ = at;
+        return true;
+    }
+    bool Done(size_t moved, size_t n) {
+        if (moved != n) {
+            position_ = kUnknown;
+            return false;
+        }
+        position_ += n;
+        return true;
+    }
+
+    FILE* stream_;
+    uint64_t position_ = kUnknown;
+};
 
 constexpr uint16_t kStripOffsets = 273, kTileOffsets = 324;
 constexpr uint16_t kStripByteCounts = 279, kTileByteCounts = 325;
@@ -162,7 +208,7 @@ public:
     PageCopier(ConversionContext* ctx, FILE* source, uint64_t sourceSize, ByteOrder sourceOrder,
                FILE* dest, ByteOrder destOrder, const PageCopyOptions& options)
         : ctx_(ctx), source_(source), sourceSize_(sourceSize), in_(ctx, sourceOrder),
-          dest_(dest), out_(ctx, destOrder), options_(options), offsets_(ctx),
+          destFile_(dest), dest_(dest), out_(ctx, destOrder), options_(options), offsets_(ctx),
           byteCounts_(ctx), newOffsets_(ctx) {}
 
     int Copy(uint32_t ifd, uint32_t position, PageCopyResult* result) {
@@ -171,7 +217,7 @@ public:
         if (bound > kMaxOffset) return Fail("Destination would exceed 4 GiB.");
         data_ = position;
         if (!WriteDirectory(ifd, position, DirKind::Page, result)) return 0;
-        if (std::fflush(dest_) != 0) return Fail("Unable to write to destination file.");
+        if (std::fflush(destFile_) != 0) return Fail("Unable to write to destination file.");
         result->dataEnd = static_cast<uint32_t>(data_);
         return 1;
     }
@@ -185,7 +231,7 @@ private:
     }
 
     bool ReadEntry(uint32_t ifd, uint32_t index, Entry* e) {
-        if (!ReadAt(source_, uint64_t{ifd} + 2 + 12u * uint64_t{index}, e->raw, 12)) return false;
+        if (!source_.Read(uint64_t{ifd} + 2 + 12u * uint64_t{index}, e->raw, 12)) return false;
         e->tag = in_.Get16(e->raw);
         e->type = in_.Get16(e->raw + 2);
         e->count = in_.Get32(e->raw + 4);
@@ -196,7 +242,7 @@ private:
 
     bool ReadCount(uint32_t ifd, uint16_t* count) {
         unsigned char bytes[2];
-        if (uint64_t{ifd} + 2 > sourceSize_ || !ReadAt(source_, ifd, bytes, 2)) return false;
+        if (uint64_t{ifd} + 2 > sourceSize_ || !source_.Read(ifd, bytes, 2)) return false;
         *count = in_.Get16(bytes);
         return uint64_t{ifd} + 2 + 12u * uint64_t{*count} + 4 <= sourceSize_;
     }
@@ -220,6 +266,9 @@ private:
     // Loads the strip offsets or byte counts of `e` into `array`: from the
     // entry when they fit in it, else from the source, widened to 32 bits.
     bool LoadStripNumbers(const Entry& e, NumberArray& array, uint64_t* total) {
+        // The numbers must be in the file before memory is taken for them.
+        if (e.byteSize > 4 && uint64_t{e.value} + e.byteSize > sourceSize_)
+            return Fail("Source value lies beyond the end of the file.");
         if (!array.Allocate(stripCount_)) return Fail("Memory allocation error.");
         const uint32_t width = e.type == kShort ? 2 : 4;
         if (e.byteSize <= 4) {
@@ -229,7 +278,7 @@ private:
             unsigned char chunk[kCopyBufferSize];
             for (uint32_t i = 0; i < e.count;) {
                 const uint32_t n = std::min<uint32_t>(e.count - i, kCopyBufferSize / width);
-                if (!ReadAt(source_, uint64_t{e.value} + uint64_t{i} * width, chunk, n * width))
+                if (!source_.Read(uint64_t{e.value} + uint64_t{i} * width, chunk, n * width))
                     return Fail("Source value lies beyond the end of the file.");
                 for (uint32_t k = 0; k < n; ++k, ++i)
                     array[i] = width == 2 ? in_.Get16(chunk + 2 * k) : in_.Get32(chunk + 4 * k);
@@ -347,9 +396,7 @@ private:
     // ------------------------------------------------------------ writing
 
     bool WriteAt(uint64_t position, const void* data, size_t n) {
-        if (SeekStream(dest_, static_cast<int64_t>(position), SEEK_SET) != 0 ||
-            std::fwrite(data, 1, n, dest_) != n)
-            return Fail("Unable to write to destination file.");
+        if (!dest_.Write(position, data, n)) return Fail("Unable to write to destination file.");
         return true;
     }
 
@@ -376,17 +423,12 @@ private:
         unsigned char buffer[kCopyBufferSize];
         // A chunk holds whole samples, so that none is split between chunks.
         const size_t chunkSize = sampleUnit > 1 ? sizeof buffer / sampleUnit * sampleUnit : sizeof buffer;
-        if (SeekStream(dest_, static_cast<int64_t>(data_), SEEK_SET) != 0)
-            return Fail("Unable to write to destination file.");
-        if (SeekStream(source_, static_cast<int64_t>(from), SEEK_SET) != 0)
-            return Fail("Error reading the source file.");
         for (uint64_t done = 0; done < n;) {
             const size_t chunk = static_cast<size_t>(std::min<uint64_t>(n - done, chunkSize));
-            if (std::fread(buffer, 1, chunk, source_) != chunk)
-                return Fail("Error reading the source file.");
+            if (!source_.Read(from + done, buffer, chunk)) return Fail("Error reading the source file.");
             ConvertValues(type, buffer, chunk);
             if (sampleUnit > 1) SwapSamples(buffer, chunk, sampleUnit);
-            if (std::fwrite(buffer, 1, chunk, dest_) != chunk)
+            if (!dest_.Write(data_ + done, buffer, chunk))
                 return Fail("Unable to write to destination file.");
             done += chunk;
         }
@@ -475,7 +517,7 @@ private:
         if (kind != DirKind::Page) return true;
 
         unsigned char link[4];
-        if (!ReadAt(source_, uint64_t{ifd} + 2 + 12u * uint64_t{count}, link, 4))
+        if (!source_.Read(uint64_t{ifd} + 2 + 12u * uint64_t{count}, link, 4))
             return Fail("Error reading the source file.");
         result->nextIfd = in_.Get32(link);
         result->nextIfdField = static_cast<uint32_t>(nextField);
@@ -528,10 +570,11 @@ private:
     }
 
     ConversionContext* ctx_;
-    FILE* source_;
+    TrackedStream source_;
     uint64_t sourceSize_;
     ByteOrderAccess in_;
-    FILE* dest_;
+    FILE* destFile_;
+    TrackedStream dest_;
     ByteOrderAccess out_;
     PageCopyOptions options_;
 

@@ -7,54 +7,24 @@
 #include <CLI/CLI.hpp>
 #include <tiffio.h>
 
+#include "commands.h"
+#include "job.h"
 #include "pivlo/pivlo.h"
 #include "zantiff/zantiff.h"
 
 namespace {
 
-// Messages of a job go to standard error with their severity.
-void PrintMessage(ConversionContext*, int severity, int, const char* text) {
-    static const char* const kPrefix[] = {"error", "warning", "trace"};
-    const int index = severity >= 0 && severity <= 2 ? severity : 0;
-    std::fprintf(stderr, "zantiff: %s: %s\n", kPrefix[index], text);
-}
-
-// A job record with the C-heap allocators and message printing, released and
-// torn down when it goes out of scope.
-class Job {
-public:
-    Job() {
-        pivloInitContext(&ctx_);
-        ctx_.hostMessageProc = PrintMessage;
-    }
-    ~Job() {
-        zanDestroyTIFF(&ctx_);
-        pivloReleaseContext(&ctx_);
-    }
-    Job(const Job&) = delete;
-    Job& operator=(const Job&) = delete;
-    ConversionContext* operator->() { return &ctx_; }
-    ConversionContext* get() { return &ctx_; }
-
-private:
-    ConversionContext ctx_{};
-};
+using zantool::Job;
 
 // Collects the handshake's report so that it can be printed as one block.
-void CollectMessage(ConversionContext* ctx, int, int, const char* text) {
-    static_cast<std::string*>(ctx->hostUserData)->append(text);
-}
-
 int RunVersion() {
     Job job;
-    std::string report;
-    job->hostMessageProc = CollectMessage;
-    job->hostUserData = &report;
+    job.Quiet();
     const int served = zanGetTiffVersion(job.get(), ZANTIFF_VERSION_MAJOR, ZANTIFF_VERSION_MINOR,
                                          ZANTIFF_VERSION_MICRO);
     if (!served) {
-        std::fprintf(stderr, "zantiff: the module refused this tool's interface version:\n%s\n",
-                     report.c_str());
+        std::fprintf(stderr, "zantiff: the module refused this tool's interface version:\n");
+        job.Print();
         return 1;
     }
     const std::string codec = TIFFGetVersion();
@@ -72,12 +42,14 @@ int main(int argc, char** argv) {
     app.add_flag("-V,--version", showVersion,
                  "Check the module's interface version and print the versions");
     app.require_subcommand(0, 1);
+    int status = 0;
+    zantool::AddPageCommands(app, status);
     try {
         app.parse(argc, argv);
     } catch (const CLI::ParseError& e) {
         return app.exit(e);
     }
     if (showVersion) return RunVersion();
-    std::fputs(app.help().c_str(), stdout);
-    return 0;
+    if (app.get_subcommands().empty()) std::fputs(app.help().c_str(), stdout);
+    return status;
 }

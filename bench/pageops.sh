@@ -1,0 +1,83 @@
+#!/usr/bin/env bash
+# Page extraction and concatenation through the zantiff tool, side by side
+# with libtiff's tiffcp and tiffsplit and with a plain copy of the same bytes
+# (cat), on a 200-page 8-bit LZW file and on a ~200 MB single-page file.
+# Wall time is the median of RUNS runs; memory is the peak RSS reported by
+# /usr/bin/time -v. Prints a Markdown table.
+# Usage: pageops.sh BUILD [RUNS]
+set -euo pipefail
+build=${1:-build}
+runs=${2:-5}
+tool="$build/bin/zantiff"
+work=$(mktemp -d)
+trap 'rm -rf "$work"' EXIT
+
+"$build/bin/bench_make_inputs" multipage "$work/multi.tif"
+"$build/bin/bench_make_inputs" large "$work/large.tif"
+printf 'II*\0\0\0\0\0' >"$work/empty.tif"   # a TIFF without pages to append to
+
+# measure PREPARE COMMAND...: runs PREPARE, then COMMAND, RUNS times; prints
+# "median-seconds peak-kilobytes" (time from the clock, memory from
+# /usr/bin/time).
+measure() {
+  local prepare=$1; shift
+  local times=() peak=0
+  for ((i = 0; i < runs; i++)); do
+    eval "$prepare"
+    local start end
+    start=$(date +%s%N)
+    /usr/bin/time -f '%M' -o "$work/time" "$@" >/dev/null 2>&1
+    end=$(date +%s%N)
+    times+=("$(( (end - start) / 1000 ))")
+    local kb
+    kb=$(tail -n 1 "$work/time")
+    [ "$kb" -gt "$peak" ] && peak=$kb
+  done
+  local median
+  median=$(printf '%s\n' "${times[@]}" | sort -n | awk '{a[NR]=$1} END {printf "%.4f", a[int((NR+1)/2)] / 1e6}')
+  echo "$median $peak"
+}
+
+row() {  # case, zantiff result, reference name, reference result
+  local z=($2) r=($4)
+  awk -v c="$1" -v zt="${z[0]}" -v zm="${z[1]}" -v rn="$3" -v rt="${r[0]}" -v rm="${r[1]}" 'BEGIN {
+    ratio = (zt > 0) ? rt / zt : 0;
+    printf "| %s | %.4f | %.1f | %s | %.4f | %.1f | %.2f |\n", c, zt, zm / 1024, rn, rt, rm / 1024, ratio }'
+}
+
+echo "| case | zantiff (s) | zantiff peak (MB) | reference | reference (s) | reference peak (MB) | ratio |"
+echo "|---|---|---|---|---|---|---|"
+
+# Every page of the 200-page file into its own file; the plain copy of the
+# same bytes into 200 files is coreutils' split.
+z=$(measure "rm -f $work/p*" "$tool" split "$work/multi.tif" -o "$work/p")
+row "split 200 pages" "$z" tiffsplit "$(measure "rm -f $work/p*" tiffsplit "$work/multi.tif" "$work/p")"
+row "split 200 pages" "$z" "split -n 200 (same bytes)" \
+    "$(measure "rm -f $work/p*" split -n 200 "$work/multi.tif" "$work/p")"
+
+# Every page of the 200-page file, one command a page (process start-up,
+# about 2.5 ms for either tool, is part of each).
+cat >"$work/each-zantiff.sh" <<SCRIPT
+for p in \$(seq 1 200); do "$tool" extract "$work/multi.tif" \$p -o "$work/one.tif"; done
+SCRIPT
+cat >"$work/each-tiffcp.sh" <<SCRIPT
+for p in \$(seq 0 199); do tiffcp "$work/multi.tif,\$p" "$work/one.tif"; done
+SCRIPT
+row "extract each of 200 pages" "$(measure "" sh "$work/each-zantiff.sh")" tiffcp \
+    "$(measure "" sh "$work/each-tiffcp.sh")"
+
+# All 200 pages appended to a file without pages.
+z=$(measure "cp $work/empty.tif $work/dest.tif" "$tool" append "$work/dest.tif" "$work/multi.tif")
+row "append 200 pages" "$z" tiffcp "$(measure "rm -f $work/out.tif" tiffcp "$work/multi.tif" "$work/out.tif")"
+row "append 200 pages" "$z" "cat (same bytes)" \
+    "$(measure "rm -f $work/copy.tif" sh -c "cat $work/empty.tif $work/multi.tif > $work/copy.tif")"
+
+# The ~200 MB page.
+z=$(measure "rm -f $work/one.tif" "$tool" extract "$work/large.tif" 1 -o "$work/one.tif")
+row "extract 200 MB page" "$z" tiffcp "$(measure "rm -f $work/one.tif" tiffcp "$work/large.tif" "$work/one.tif")"
+row "extract 200 MB page" "$z" "cat (same bytes)" \
+    "$(measure "rm -f $work/copy.tif" sh -c "cat $work/large.tif > $work/copy.tif")"
+z=$(measure "cp $work/empty.tif $work/dest.tif" "$tool" append "$work/dest.tif" "$work/large.tif")
+row "append 200 MB page" "$z" tiffcp "$(measure "rm -f $work/out.tif" tiffcp "$work/empty.tif" "$work/large.tif" "$work/out.tif")"
+row "append 200 MB page" "$z" "cat (same bytes)" \
+    "$(measure "rm -f $work/copy.tif" sh -c "cat $work/empty.tif $work/large.tif > $work/copy.tif")"

@@ -1,0 +1,11 @@
+// The tool's commands, each registered on the main application.
+#pragma once
+
+#include <CLI/CLI.hpp>
+
+namespace zantool {
+
+// append, extract, split, set-tags
+void AddPageCommands(CLI::App& app, int& status);
+
+}  // namespace zantool

@@ -6,6 +6,7 @@
 // oversized transfers, and turns anything that cannot be expressed in 32 bits
 // into an I/O failure instead of letting it wrap.
 
+#include "adapter.h"
 #include "osttiff/osttiff.h"
 
 #include <cstdlib>
@@ -15,21 +16,10 @@
 
 namespace {
 
-struct Adapter {
-    void* client;
-    PivloReadWriteProc read;
-    PivloReadWriteProc write;
-    PivloSeekProc seek;
-    PivloCloseProc close;
-    PivloSizeProc size;
-    PivloMapProc map;
-    PivloUnmapProc unmap;
-    PivloAllocProc alloc;
-    PivloReallocProc realloc_;
-    PivloFreeProc free_;
-    void* context;
-    int ioFailed;
-};
+using osttiff::Adapter;
+using osttiff::AdapterOfTiff;
+
+
 
 // Largest single transfer handed to a 32-bit procedure.
 constexpr tmsize_t kMaxTransfer = 0x40000000;
@@ -139,13 +129,17 @@ void UnmapThunk(thandle_t h, void* base, toff_t size) {
     if (a->unmap) a->unmap(a->client, base, static_cast<uint32_t>(size));
 }
 
-// The adapter of a codec object opened here; null for any other object.
-Adapter* AdapterOfTiff(TIFF* tif) {
-    if (!tif || TIFFGetReadProc(tif) != ReadThunk) return nullptr;
-    return AdapterOf(TIFFClientdata(tif));
-}
 
 }  // namespace
+
+namespace osttiff {
+
+Adapter* AdapterOfTiff(TIFF* tif) {
+    if (!tif || TIFFGetReadProc(tif) != ReadThunk) return nullptr;
+    return static_cast<Adapter*>(TIFFClientdata(tif));
+}
+
+}  // namespace osttiff
 
 extern "C" {
 
@@ -162,8 +156,7 @@ TIFF* TIFFClientOpenPivloExt(const char* name, const char* mode, void* clientDat
         return nullptr;
     }
     auto* a = new (block) Adapter{clientData, readProc, writeProc, seekProc, closeProc, sizeProc,
-                                  mapProc, unmapProc, allocProc, reallocProc, freeProc,
-                                  nullptr, 0};
+                                  mapProc, unmapProc, allocProc, reallocProc, freeProc};
     TIFF* tif = TIFFClientOpenExt(name ? name : "", mode, a, ReadThunk, WriteThunk, SeekThunk,
                                   CloseThunk, SizeThunk, MapThunk, UnmapThunk, options);
     // libtiff does not call the close procedure when the open fails.

@@ -23,6 +23,7 @@ struct MessageSlots {
 };
 
 MessageSlots gSlots;
+uint64_t gErrorsDelivered = 0;
 
 constexpr const char kOverrunNotice[] = "DANGER OUTPUT MESSAGE BUFFER OVERRUN";
 
@@ -112,8 +113,11 @@ void RestoreCodecMessages(ConversionContext* ctx) {
     gSlots = MessageSlots{};
 }
 
+uint64_t CodecErrorsDelivered() { return gErrorsDelivered; }
+
 void CodecErrorToHost(const char* module, const char* format, va_list args) {
     if (!ErrorSinkSet()) return;
+    ++gErrorsDelivered;
     char text[MESSAGE_BUFFER_SIZE];
     if (!FormatCodecMessage(text, module, format, args))
         SendTo(gSlots.error, gSlots.errorEx, kOverrunNotice);

@@ -3,6 +3,7 @@
 #pragma once
 
 #include <cstdarg>
+#include <cstdint>
 
 #include "zantiff/conversion_context.h"
 
@@ -21,6 +22,11 @@ void RedirectCodecMessages(ConversionContext* ctx);
 // has no redirection in force (so a job that never opened anything leaves the
 // codec's handlers alone).
 void RestoreCodecMessages(ConversionContext* ctx);
+
+// Number of codec error texts delivered to a host sink so far (process-wide),
+// so that a caller can tell whether a failing codec call has explained
+// itself to the host.
+uint64_t CodecErrorsDelivered();
 
 // The handlers, with the codec library's handler signature.
 void CodecErrorToHost(const char* module, const char* format, va_list args);

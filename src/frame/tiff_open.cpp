@@ -10,6 +10,7 @@
 #include "frame/io_procs.h"
 #include "osttiff/osttiff.h"
 #include "pivlo/pivlo.h"
+#include "read/reader_buffers.h"
 #include "zantiff/zantiff.h"
 
 namespace zan {
@@ -193,8 +194,8 @@ extern "C" ZAN_API void zanDestroyTIFF(ConversionContext* ctx) {
     if (ctx->state == ZAN_STATE_WRITING && ctx->tiff) {
         TIFFWriteDirectory(ctx->tiff);
     } else if (ctx->state == ZAN_STATE_READING) {
-        ReleaseField(ctx, ctx->stripBuffer);
-        if (ctx->paletteExpansion) ReleaseField(ctx, ctx->frameData);
+        // The strip buffer, work line and palette copy of the scanline reader.
+        ReleaseReaderBuffers(ctx);
     }
     if (ctx->sourceKind == ZAN_SOURCE_STREAM) CloseStreamBuffer(ctx);
     if (ctx->tiff) {

@@ -75,6 +75,21 @@ bool SetPageTags(TIFF* tif, const PageSpec& p) {
                                 p.extraSamples.data());
     if (!p.description.empty())
         ok = ok && TIFFSetField(tif, TIFFTAG_IMAGEDESCRIPTION, p.description.c_str());
+    if (!p.documentName.empty())
+        ok = ok && TIFFSetField(tif, TIFFTAG_DOCUMENTNAME, p.documentName.c_str());
+    if (p.xResolution != 0) ok = ok && TIFFSetField(tif, TIFFTAG_XRESOLUTION, static_cast<double>(p.xResolution));
+    if (p.yResolution != 0) ok = ok && TIFFSetField(tif, TIFFTAG_YRESOLUTION, static_cast<double>(p.yResolution));
+    if (p.resolutionUnit) ok = ok && TIFFSetField(tif, TIFFTAG_RESOLUTIONUNIT, p.resolutionUnit);
+    if (p.fillOrder) ok = ok && TIFFSetField(tif, TIFFTAG_FILLORDER, p.fillOrder);
+    if (!p.iccProfile.empty())
+        ok = ok && TIFFSetField(tif, TIFFTAG_ICCPROFILE, static_cast<uint32_t>(p.iccProfile.size()),
+                                p.iccProfile.data());
+    if (!p.colorMap.empty()) {
+        const size_t n = p.colorMap.size() / 3;
+        ok = ok && TIFFSetField(tif, TIFFTAG_COLORMAP, p.colorMap.data(), p.colorMap.data() + n,
+                                p.colorMap.data() + 2 * n);
+    }
+    if (p.jpegQuality) ok = ok && TIFFSetField(tif, TIFFTAG_JPEGQUALITY, p.jpegQuality);
     if (p.tileWidth) {
         ok = ok && TIFFSetField(tif, TIFFTAG_TILEWIDTH, p.tileWidth) &&
              TIFFSetField(tif, TIFFTAG_TILELENGTH, p.tileHeight);

@@ -39,6 +39,14 @@ struct PageSpec {
     uint32_t tileHeight = 0;
     std::vector<uint16_t> extraSamples;  // ExtraSamples values, written when not empty
     std::string description;             // ImageDescription when not empty
+    std::string documentName;            // DocumentName when not empty
+    float xResolution = 0;               // XResolution/YResolution when nonzero
+    float yResolution = 0;
+    uint16_t resolutionUnit = 0;         // ResolutionUnit when nonzero
+    uint16_t fillOrder = 0;              // FillOrder when nonzero
+    Bytes iccProfile;                    // ICCProfile when not empty
+    std::vector<uint16_t> colorMap;      // ColorMap (red, green, blue tables) when not empty
+    int jpegQuality = 0;                 // JPEG pages: quality when nonzero
 };
 
 struct FileSpec {

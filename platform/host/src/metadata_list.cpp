@@ -22,12 +22,20 @@ MetadataEntry*& Tail(MetadataList* list) {
     return reinterpret_cast<MetadataEntry*&>(list->reserved);
 }
 
+// The C heap, for lists created without procedures of their own.
+void* HeapAlloc(uint32_t n) { return std::malloc(n ? n : 1); }
+void HeapFree(void* block) { std::free(block); }
+
 }  // namespace
 
 extern "C" {
 
 MetadataList* pivloCreateMetadataList(MetadataAllocProc allocProc, MetadataFreeProc freeProc) {
-    void* block = allocProc ? allocProc(sizeof(MetadataList)) : std::malloc(sizeof(MetadataList));
+    if (!allocProc || !freeProc) {
+        allocProc = HeapAlloc;
+        freeProc = HeapFree;
+    }
+    void* block = allocProc(sizeof(MetadataList));
     if (!block) return nullptr;
     auto* list = static_cast<MetadataList*>(block);
     list->allocProc = allocProc;

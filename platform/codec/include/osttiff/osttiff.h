@@ -83,6 +83,37 @@ OSTTIFF_API int TIFFIOFailedPivlo(TIFF* tif);
 OSTTIFF_API int TIFFGetStrileOffset32(TIFF* tif, uint32_t strile, uint32_t* offset);
 OSTTIFF_API int TIFFGetStrileByteCount32(TIFF* tif, uint32_t strile, uint32_t* byteCount);
 
+/* ---- field descriptions ----
+ * The description of `tag` in the codec object's current field set, as the
+ * libtiff 3.x record: tag, read and write counts, data type, pass-count flag
+ * and name. 1 when the tag is known, 0 (and nothing reported) when not. */
+OSTTIFF_API int TIFFFieldInfoPivlo(TIFF* tif, uint32_t tag, TIFFFieldInfo* info);
+
+/* ---- directory as stored ----
+ * libtiff completes some fields that a directory does not hold (it invents
+ * ExtraSamples for surplus samples). These answer from the current
+ * directory's entries in the file: 1 when the tag is present, 0 when absent,
+ * -1 when the entries cannot be read again (a stream source that has
+ * released them). */
+OSTTIFF_API int TIFFDirectoryHasTagPivlo(TIFF* tif, uint32_t tag);
+
+/* ExtraSamples as the current directory stores it: the count and values
+ * when the tag is present, count 0 when it is absent. When the directory
+ * cannot be read again, libtiff's own answer is given. 1 on success. */
+OSTTIFF_API int TIFFGetStoredExtraSamplesPivlo(TIFF* tif, uint16_t* count, const uint16_t** values);
+
+/* ---- EXIF directories ----
+ * Work on an EXIF directory is bracketed by zanBeginTiffEXIFDir and
+ * zanEndTiffEXIFDir; the bracket records the image directory it started
+ * from. Both return 1, 0 for a codec object not opened here or an End
+ * without a Begin. */
+OSTTIFF_API int zanBeginTiffEXIFDir(TIFF* tif);
+OSTTIFF_API int zanEndTiffEXIFDir(TIFF* tif);
+/* Nonzero between zanBeginTiffEXIFDir and zanEndTiffEXIFDir. */
+OSTTIFF_API int TIFFInEXIFDirPivlo(TIFF* tif);
+/* The image directory (index) current when the bracket began. */
+OSTTIFF_API tdir_t TIFFEXIFBaseDirectoryPivlo(TIFF* tif);
+
 /* Blocks of this layer from the host allocator handed to the codec object
  * (the C heap when none was given). */
 OSTTIFF_API void* PivloMalloc(TIFF* tif, uint32_t byteCount);

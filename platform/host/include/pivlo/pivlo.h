@@ -70,7 +70,9 @@ PIVLO_API void zanResetWorkBuffer(ConversionContext* ctx);
 /* ---- metadata list ---- */
 
 /* A new empty list whose entries and blocks come from allocProc/freeProc
- * (the C heap when null). Null when the list cannot be allocated. */
+ * (the C heap when either is null; the list's members then name the heap
+ * procedures, so that the module allocates blocks for it from the heap as
+ * well). Null when the list cannot be allocated. */
 PIVLO_API MetadataList* pivloCreateMetadataList(MetadataAllocProc allocProc,
                                                 MetadataFreeProc freeProc);
 

@@ -152,6 +152,36 @@ bool WritePages(TIFF* tif, const FileSpec& spec, uint32_t firstPageIndex) {
     return true;
 }
 
+bool WriteExifForNextPage(TIFF* tif, void (*fill)(TIFF*)) {
+    uint64_t offset = 0;
+    if (TIFFCreateEXIFDirectory(tif) != 0) return false;
+    fill(tif);
+    if (!TIFFWriteCustomDirectory(tif, &offset)) return false;
+    TIFFFreeDirectory(tif);
+    TIFFCreateDirectory(tif);
+    return TIFFSetField(tif, TIFFTAG_EXIFIFD, offset) != 0;
+}
+
+void FillTypicalExif(TIFF* tif) {
+    static const uint16_t iso[3] = {100, 200, 400};
+    TIFFSetField(tif, EXIFTAG_EXPOSURETIME, 0.004);
+    TIFFSetField(tif, EXIFTAG_FNUMBER, 2.8);
+    TIFFSetField(tif, EXIFTAG_ISOSPEEDRATINGS, 3, iso);
+    TIFFSetField(tif, EXIFTAG_EXIFVERSION, "0231");
+    TIFFSetField(tif, EXIFTAG_DATETIMEORIGINAL, "2024:05:06 07:08:09");
+    TIFFSetField(tif, EXIFTAG_IMAGEUNIQUEID, "0123456789abcdef0123456789abcdef");
+}
+
+Bytes MakeExifTiff() {
+    TempFile file;
+    TIFF* tif = TIFFOpen(file.c_str(), "w");
+    if (!tif) throw std::runtime_error("libtiff cannot create a file");
+    const bool ok = WriteExifForNextPage(tif, FillTypicalExif) && WritePages(tif, FileSpec{});
+    TIFFClose(tif);
+    if (!ok) throw std::runtime_error("libtiff refused the EXIF fixture");
+    return ReadFileBytes(file.path());
+}
+
 void WriteTiffFile(const std::string& path, const FileSpec& spec) {
     std::string mode = "w";
     mode += spec.bigEndian ? "b" : "l";

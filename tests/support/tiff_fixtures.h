@@ -58,6 +58,18 @@ struct FileSpec {
 // Deterministic sample value of (page, x, y, sample), masked to the depth.
 uint32_t PixelValue(uint32_t page, uint32_t x, uint32_t y, uint32_t sample, uint16_t bits);
 
+// Writes an EXIF directory filled by `fill` (TIFFSetField calls) before the
+// page's own tags, and points the page at it; the image directory must be
+// empty when this is called (libtiff 4.5's working sequence).
+bool WriteExifForNextPage(TIFF* tif, void (*fill)(TIFF*));
+
+// Fills a typical EXIF directory: ExposureTime, FNumber, ISOSpeedRatings
+// (3 values), ExifVersion, DateTimeOriginal, ImageUniqueID.
+void FillTypicalExif(TIFF* tif);
+
+// A one-page grey file with the typical EXIF directory.
+Bytes MakeExifTiff();
+
 // Writes the file with libtiff to `path`.
 void WriteTiffFile(const std::string& path, const FileSpec& spec);
 // The same file as bytes.

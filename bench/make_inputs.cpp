@@ -1,8 +1,11 @@
 // Writes the benchmark inputs with libtiff:
 //   make_inputs multipage OUT.tif   200 pages of 512x512 8-bit grey, LZW
 //   make_inputs large OUT.tif       one 8192x8192 8-bit RGB page, uncompressed (~200 MB)
+//   make_inputs sample OUT.tif      the demo's 3-page file: RGB (LZW), palette, 16-bit grey
+//   make_inputs rgb W H OUT.tif     one W x H 8-bit RGB page, uncompressed
 
 #include <cstdio>
+#include <cstdlib>
 #include <cstring>
 #include <string>
 #include <vector>
@@ -31,19 +34,66 @@ bool WritePage(TIFF* tif, uint32_t width, uint32_t height, uint16_t samples, uin
     return TIFFWriteDirectory(tif) != 0;
 }
 
+// A palette page: a colour wheel of 256 entries, indices in bands.
+bool WritePalettePage(TIFF* tif, uint32_t width, uint32_t height) {
+    TIFFSetField(tif, TIFFTAG_IMAGEWIDTH, width);
+    TIFFSetField(tif, TIFFTAG_IMAGELENGTH, height);
+    TIFFSetField(tif, TIFFTAG_BITSPERSAMPLE, 8);
+    TIFFSetField(tif, TIFFTAG_SAMPLESPERPIXEL, 1);
+    TIFFSetField(tif, TIFFTAG_PHOTOMETRIC, PHOTOMETRIC_PALETTE);
+    TIFFSetField(tif, TIFFTAG_COMPRESSION, COMPRESSION_PACKBITS);
+    TIFFSetField(tif, TIFFTAG_IMAGEDESCRIPTION, "palette page");
+    std::vector<uint16_t> map(768);
+    for (int i = 0; i < 256; ++i) {
+        map[i] = static_cast<uint16_t>((i * 7 % 256) * 257);
+        map[256 + i] = static_cast<uint16_t>((255 - i) * 257);
+        map[512 + i] = static_cast<uint16_t>((i * 3 % 256) * 257);
+    }
+    TIFFSetField(tif, TIFFTAG_COLORMAP, map.data(), map.data() + 256, map.data() + 512);
+    std::vector<uint8_t> row(width);
+    for (uint32_t y = 0; y < height; ++y) {
+        for (uint32_t x = 0; x < width; ++x) row[x] = static_cast<uint8_t>((x / 10 + y / 10 * 16) & 0xFF);
+        if (TIFFWriteScanline(tif, row.data(), y, 0) < 0) return false;
+    }
+    return TIFFWriteDirectory(tif) != 0;
+}
+
+// A 16-bit grey page: a smooth ramp.
+bool WriteGrey16Page(TIFF* tif, uint32_t width, uint32_t height) {
+    TIFFSetField(tif, TIFFTAG_IMAGEWIDTH, width);
+    TIFFSetField(tif, TIFFTAG_IMAGELENGTH, height);
+    TIFFSetField(tif, TIFFTAG_BITSPERSAMPLE, 16);
+    TIFFSetField(tif, TIFFTAG_SAMPLESPERPIXEL, 1);
+    TIFFSetField(tif, TIFFTAG_PHOTOMETRIC, PHOTOMETRIC_MINISBLACK);
+    TIFFSetField(tif, TIFFTAG_COMPRESSION, COMPRESSION_ADOBE_DEFLATE);
+    TIFFSetField(tif, TIFFTAG_IMAGEDESCRIPTION, "16-bit grey page");
+    std::vector<uint16_t> row(width);
+    for (uint32_t y = 0; y < height; ++y) {
+        for (uint32_t x = 0; x < width; ++x) row[x] = static_cast<uint16_t>(x * 65535 / width);
+        if (TIFFWriteScanline(tif, row.data(), y, 0) < 0) return false;
+    }
+    return TIFFWriteDirectory(tif) != 0;
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
-    if (argc != 3) {
-        std::fprintf(stderr, "usage: make_inputs multipage|large OUT.tif\n");
+    if (argc < 3) {
+        std::fprintf(stderr, "usage: make_inputs multipage|large|sample OUT.tif | rgb W H OUT.tif\n");
         return 2;
     }
     const std::string kind = argv[1];
-    TIFF* tif = TIFFOpen(argv[2], "w");
+    TIFF* tif = TIFFOpen(argv[argc - 1], "w");
     if (!tif) return 1;
     bool ok = true;
     if (kind == "multipage") {
         for (uint32_t page = 0; page < 200 && ok; ++page) ok = WritePage(tif, 512, 512, 1, COMPRESSION_LZW, page);
+    } else if (kind == "sample") {
+        ok = WritePage(tif, 160, 120, 3, COMPRESSION_LZW, 0) && WritePalettePage(tif, 160, 120) &&
+             WriteGrey16Page(tif, 160, 120);
+    } else if (kind == "rgb" && argc == 5) {
+        ok = WritePage(tif, static_cast<uint32_t>(std::atoi(argv[2])), static_cast<uint32_t>(std::atoi(argv[3])), 3,
+                       COMPRESSION_NONE, 0);
     } else {
         ok = WritePage(tif, 8192, 8192, 3, COMPRESSION_NONE, 0);
     }

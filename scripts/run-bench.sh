@@ -27,10 +27,12 @@ done
   echo "| case | module (ms) | reference | reference (ms) | ratio |"
   echo "|---|---|---|---|---|"
   awk -F, '
-    { name=$1; gsub(/"/, "", name); sub(/_median$/, "", name); sub(/\/.*$/, "", name);
+    { name=$1; gsub(/"/, "", name); sub(/_median$/, "", name);
       t=$3; unit=$5; gsub(/"/, "", unit);
       if (unit == "ns") t /= 1e6; else if (unit == "us") t /= 1e3; else if (unit == "s") t *= 1e3;
-      split(name, parts, "_"); who=parts[1]; what=substr(name, length(who) + 2);
+      # Module_Case or Module/Case (BENCHMARK_CAPTURE) against Reference_Case or Reference/Case.
+      split_at = index(name, "/"); if (split_at == 0) split_at = index(name, "_");
+      who = substr(name, 1, split_at - 1); what = substr(name, split_at + 1);
       time[who "|" what] = t; if (who == "Module") cases[what] = 1; else refs[what] = refs[what] " " who }
     END {
       for (c in cases) { n = split(refs[c], r, " ");

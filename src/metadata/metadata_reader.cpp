@@ -186,12 +186,15 @@ private:
     }
 
     // One EXIF tag in the form its description gives; *present is false for
-    // tags that are skipped or not delivered.
+    // tags that are skipped or not delivered. Fields that pass a count
+    // (variable-length ones, and tags libtiff does not know) are read with
+    // their count, whatever their type.
     bool ReadExifTag(uint32_t tag, const TIFFFieldInfo& info, MetadataEntry& entry, bool* present) {
         const TIFFField* field = TIFFFindField(tif_, tag, TIFF_ANY);
         const int elementSize = TIFFFieldSetGetSize(field);
         switch (info.field_type) {
         case TIFF_ASCII: {
+            if (info.field_passcount) return ReadCountedText(tag, field, entry, present);
             char* text = nullptr;
             if (!TIFFGetField(tif_, tag, &text) || !text) return true;
             *present = true;
@@ -212,6 +215,32 @@ private:
             zanWarning(ctx_, "Unknown TIFF Exif type");
             return true;
         }
+    }
+
+    // The count and address of a field that passes its count, read with a
+    // count of the width the codec uses (16 or 32 bits; a 16-bit count is
+    // taken as signed). False when the codec does not deliver it.
+    bool GetCounted(uint32_t tag, const TIFFField* field, uint32_t* count, void** data) {
+        if (TIFFFieldSetGetCountSize(field) == 4) return TIFFGetField(tif_, tag, count, data) != 0;
+        uint16_t count16 = 0;
+        if (!TIFFGetField(tif_, tag, &count16, data) || static_cast<int16_t>(count16) < 0) return false;
+        *count = count16;
+        return true;
+    }
+
+    // A text that comes with its count (libtiff's form for tags it does not
+    // know); the block always ends with a terminating zero.
+    bool ReadCountedText(uint32_t tag, const TIFFField* field, MetadataEntry& entry, bool* present) {
+        uint32_t count = 0;
+        void* data = nullptr;
+        if (!GetCounted(tag, field, &count, &data) || !data) return true;
+        const auto* text = static_cast<const char*>(data);
+        const uint32_t length = static_cast<uint32_t>(strnlen(text, count));
+        if (length == 0xFFFFFFFFu) return true;
+        *present = true;
+        if (!MakeBlock(entry, text, length + 1, 0)) return false;
+        static_cast<char*>(entry.value.block)[length] = '\0';
+        return true;
     }
 
     bool ReadScalar(uint32_t tag, const TIFFFieldInfo& info, int elementSize, MetadataEntry& entry,
@@ -235,14 +264,7 @@ private:
         void* data = nullptr;
         uint32_t count = 0;
         if (info.field_passcount) {
-            if (TIFFFieldSetGetCountSize(field) == 4) {
-                if (!TIFFGetField(tif_, tag, &count, &data)) return true;
-            } else {
-                uint16_t count16 = 0;
-                if (!TIFFGetField(tif_, tag, &count16, &data)) return true;
-                if (static_cast<int16_t>(count16) < 0) return true;
-                count = count16;
-            }
+            if (!GetCounted(tag, field, &count, &data)) return true;
         } else if (info.field_readcount > 1) {
             if (!TIFFGetField(tif_, tag, &data)) return true;
             count = static_cast<uint32_t>(info.field_readcount);

@@ -8,4 +8,7 @@ namespace zantool {
 // append, extract, split, set-tags
 void AddPageCommands(CLI::App& app, int& status);
 
+// info, decode
+void AddReadCommands(CLI::App& app, int& status);
+
 }  // namespace zantool

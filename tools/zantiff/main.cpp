@@ -43,6 +43,7 @@ int main(int argc, char** argv) {
                  "Check the module's interface version and print the versions");
     app.require_subcommand(0, 1);
     int status = 0;
+    zantool::AddReadCommands(app, status);
     zantool::AddPageCommands(app, status);
     try {
         app.parse(argc, argv);

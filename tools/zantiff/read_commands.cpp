@@ -1,0 +1,307 @@
+// Commands that read pages: info (description and metadata, text or JSON)
+// and decode (the scanline reader's lines as PNG or PAM).
+
+#include <tiffio.h>
+
+#include <algorithm>
+#include <cctype>
+#include <cstdio>
+#include <cstring>
+#include <nlohmann/json.hpp>
+#include <string>
+#include <vector>
+
+#include "commands.h"
+#include "image_writers.h"
+#include "job.h"
+
+namespace zantool {
+namespace {
+
+using nlohmann::ordered_json;
+
+const char* ImageTypeName(uint32_t code) {
+    switch (code) {
+    case ZAN_IMAGE_BILEVEL_WHITE_IS_ZERO: return "bilevel, min-is-white";
+    case ZAN_IMAGE_BILEVEL_BLACK_IS_ZERO: return "bilevel, min-is-black";
+    case ZAN_IMAGE_GREY_WHITE_IS_ZERO: return "grey, min-is-white";
+    case ZAN_IMAGE_GREY_BLACK_IS_ZERO: return "grey, min-is-black";
+    case ZAN_IMAGE_RGB: return "RGB";
+    case ZAN_IMAGE_PALETTE: return "palette";
+    case ZAN_IMAGE_MASK: return "mask";
+    case ZAN_IMAGE_SEPARATED: return "separated";
+    case ZAN_IMAGE_CMYK: return "CMYK";
+    case ZAN_IMAGE_YCBCR: return "YCbCr";
+    case ZAN_IMAGE_CIELAB: return "CIELab";
+    case ZAN_IMAGE_LOGL: return "LogL";
+    case ZAN_IMAGE_LOGLUV: return "LogLuv";
+    default: return "other";
+    }
+}
+
+const char* CompressionName(uint32_t code) {
+    static const char* const kNames[] = {"other", "none", "PackBits", "CCITT G3", "CCITT G4", "JPEG",
+                                         "CCITT RLE", "LZW", "NeXT", "CCITT RLEW", "ThunderScan",
+                                         "old-style JPEG"};
+    return code < sizeof kNames / sizeof *kNames ? kNames[code] : "other";
+}
+
+// libtiff's names of tags, for the listing: image tags from a directory of
+// the file, EXIF tags from its EXIF field set.
+class TagNames {
+public:
+    explicit TagNames(const std::string& path) {
+        const TIFFErrorHandler e = TIFFSetErrorHandler(nullptr), w = TIFFSetWarningHandler(nullptr);
+        image_ = TIFFOpen(path.c_str(), "r");
+        exif_ = TIFFOpen(path.c_str(), "r");
+        uint64_t offset = 0;
+        if (exif_ && !(TIFFGetField(exif_, TIFFTAG_EXIFIFD, &offset) && TIFFReadEXIFDirectory(exif_, offset))) {
+            TIFFClose(exif_);
+            exif_ = nullptr;
+        }
+        TIFFSetErrorHandler(e);
+        TIFFSetWarningHandler(w);
+    }
+    ~TagNames() {
+        if (image_) TIFFClose(image_);
+        if (exif_) TIFFClose(exif_);
+    }
+    std::string Name(uint32_t group, uint32_t tag) const {
+        TIFF* tif = group == ZAN_METADATA_EXIF ? exif_ : image_;
+        const TIFFField* field = tif ? TIFFFindField(tif, tag, TIFF_ANY) : nullptr;
+        return field ? TIFFFieldName(field) : "Tag " + std::to_string(tag);
+    }
+
+private:
+    TIFF* image_ = nullptr;
+    TIFF* exif_ = nullptr;
+};
+
+// A metadata value as JSON: text, a number, an array of numbers, or hex.
+ordered_json EntryValue(const MetadataEntry& e) {
+    switch (e.type) {
+    case ZAN_METADATA_U8: return e.value.u8;
+    case ZAN_METADATA_U16:
+        // Image-directory pairs give their value count (2) as size; EXIF
+        // entries give the byte size of one value.
+        return e.group != ZAN_METADATA_EXIF && e.size == 2 ? ordered_json::array({e.value.u16[0], e.value.u16[1]})
+                                                            : ordered_json(e.value.u16[0]);
+    case ZAN_METADATA_U32: return e.value.u32;
+    case ZAN_METADATA_F32: return e.value.f32;
+    case ZAN_METADATA_F64: return e.value.f64;
+    case ZAN_METADATA_BLOCK: {
+        const auto* bytes = static_cast<const uint8_t*>(e.value.block);
+        const bool text = e.size > 0 && bytes[e.size - 1] == 0 &&
+                          std::all_of(bytes, bytes + e.size - 1, [](uint8_t c) { return std::isprint(c) || c == '\n'; });
+        if (text) return std::string(reinterpret_cast<const char*>(bytes));
+        std::string hex;
+        char digits[3];
+        for (uint32_t i = 0; i < e.size && i < 64; ++i) {
+            std::snprintf(digits, sizeof digits, "%02x", bytes[i]);
+            hex += digits;
+        }
+        if (e.size > 64) hex += "...";
+        return hex;
+    }
+    default: {
+        std::string hex;
+        char digits[3];
+        for (uint8_t b : e.value.bytes) {
+            std::snprintf(digits, sizeof digits, "%02x", b);
+            hex += digits;
+        }
+        return hex;
+    }
+    }
+}
+
+ordered_json Describe(ConversionContext* ctx, int page, const MetadataList* list, const TagNames& names) {
+    ordered_json info;
+    info["pages"] = ctx->pageCount;
+    info["page"] = page;
+    info["width"] = ctx->imageWidth;
+    info["height"] = ctx->imageHeight;
+    info["bitsPerSample"] = ctx->bitsPerSample;
+    info["samplesPerPixel"] = ctx->samplesPerPixel;
+    info["extraSamples"] = ctx->extraSamples;
+    info["imageType"] = ImageTypeName(ctx->imageType);
+    info["colorSpace"] = ctx->colorSpace;
+    info["compression"] = CompressionName(ctx->compression);
+    info["planarConfig"] = ctx->planarConfig == 1 ? "contiguous" : "separate";
+    info["orientation"] = ctx->orientation;
+    info["xResolution"] = ctx->xResolution;
+    info["yResolution"] = ctx->yResolution;
+    info["resolutionUnit"] = ctx->resolutionUnit == 0 ? "none" : ctx->resolutionUnit == 2 ? "centimetre" : "inch";
+    if (ctx->tileWidth) info["tile"] = {ctx->tileWidth, ctx->tileHeight};
+    info["fillOrder"] = ctx->fillOrder;
+    info["iccProfileBytes"] = ctx->iccProfileSize;
+    if (ctx->imageDescription) info["imageDescription"] = ctx->imageDescription;
+    if (ctx->documentName) info["documentName"] = ctx->documentName;
+    ordered_json entries = ordered_json::array();
+    for (const MetadataEntry* e = pivloMetadataListFirst(list); e; e = e->next) {
+        ordered_json entry;
+        entry["group"] = e->group == ZAN_METADATA_EXIF ? "exif" : e->group == ZAN_METADATA_ICC ? "icc" : "image";
+        entry["tag"] = e->tag;
+        entry["name"] = names.Name(e->group, e->tag);
+        if (e->count) entry["count"] = e->count;
+        entry["value"] = EntryValue(*e);
+        entries.push_back(entry);
+    }
+    info["metadata"] = entries;
+    return info;
+}
+
+void PrintText(const ordered_json& info) {
+    for (const auto& [key, value] : info.items()) {
+        if (key == "metadata") continue;
+        std::printf("%-18s %s\n", (key + ":").c_str(), value.is_string() ? value.get<std::string>().c_str() : value.dump().c_str());
+    }
+    for (const auto& e : info["metadata"]) {
+        const std::string value = e["value"].is_string() ? e["value"].get<std::string>() : e["value"].dump();
+        std::printf("  %-5s %-28s %s\n", e["group"].get<std::string>().c_str(), e["name"].get<std::string>().c_str(),
+                    value.c_str());
+    }
+}
+
+int Info(const std::string& path, int page, bool json) {
+    File in = OpenFile(path, "rb");
+    if (!in) return 1;
+    Job job;
+    MetadataList* list = pivloCreateMetadataList(nullptr, nullptr);
+    job->sourceKind = ZAN_SOURCE_FILE;
+    job->sourceFp = in.get();
+    job->pageNumber = page;
+    job->metadataList = list;
+    const int described = zanTIFFGetInfo(job.get());
+    if (described) {
+        const ordered_json info = Describe(job.get(), page, list, TagNames(path));
+        if (json) std::printf("%s\n", info.dump(2).c_str());
+        else PrintText(info);
+    }
+    job->metadataList = nullptr;
+    pivloDestroyMetadataList(list);
+    return described ? 0 : 1;
+}
+
+// ---- decode ----
+
+// How the lines of the described page are laid out, and what to write them
+// as. Lines of separate planes are interleaved before writing.
+ImageLayout LayoutOf(const ConversionContext* ctx) {
+    ImageLayout layout;
+    layout.width = ctx->imageWidth;
+    layout.height = ctx->imageHeight;
+    layout.channels = ctx->samplesPerPixel;
+    layout.bits = ctx->bitsPerSample == 16 ? 16 : ctx->bitsPerSample == 1 ? 1 : 8;
+    switch (ctx->imageType) {
+    case ZAN_IMAGE_PALETTE:
+        layout.channels = 3;
+        layout.bits = 8;
+        layout.tupleType = "RGB";
+        break;
+    case ZAN_IMAGE_CMYK: layout.tupleType = "CMYK"; break;
+    case ZAN_IMAGE_SEPARATED: layout.tupleType = "SEPARATED"; break;
+    case ZAN_IMAGE_RGB: case ZAN_IMAGE_YCBCR: case ZAN_IMAGE_CIELAB:
+        layout.tupleType = ctx->samplesPerPixel > 3 ? "RGB_ALPHA" : "RGB";
+        break;
+    default: layout.tupleType = ctx->samplesPerPixel > 1 ? "GRAYSCALE_ALPHA" : "GRAYSCALE"; break;
+    }
+    return layout;
+}
+
+bool NeedsPam(const ConversionContext* ctx, const ImageLayout& layout) {
+    const bool separated = ctx->imageType == ZAN_IMAGE_CMYK || ctx->imageType == ZAN_IMAGE_SEPARATED;
+    return separated || layout.channels > 4 || (layout.bits == 1 && layout.channels > 1);
+}
+
+// Puts the planes of a separate-planes line pixel by pixel.
+void Interleave(const std::vector<uint8_t>& line, std::vector<uint8_t>& out, const ImageLayout& layout) {
+    const size_t sampleBytes = layout.bits / 8;
+    for (uint32_t x = 0; x < layout.width; ++x)
+        for (uint32_t s = 0; s < layout.channels; ++s)
+            std::memcpy(&out[(static_cast<size_t>(x) * layout.channels + s) * sampleBytes],
+                        &line[(static_cast<size_t>(s) * layout.width + x) * sampleBytes], sampleBytes);
+}
+
+// Min-is-white grey becomes min-is-black, as PNG and PAM have it; extra
+// samples (alpha) stay as they are.
+void InvertGrey(std::vector<uint8_t>& line, uint32_t bytes, const ImageLayout& layout, bool planar) {
+    if (layout.bits == 1 || layout.channels == 1) {
+        for (uint32_t i = 0; i < bytes; ++i) line[i] = static_cast<uint8_t>(~line[i]);
+        return;
+    }
+    const size_t sampleBytes = layout.bits / 8;
+    for (uint32_t x = 0; x < layout.width; ++x) {
+        const size_t at = (planar ? x : static_cast<size_t>(x) * layout.channels) * sampleBytes;
+        for (size_t b = 0; b < sampleBytes; ++b) line[at + b] = static_cast<uint8_t>(~line[at + b]);
+    }
+}
+
+int Decode(const std::string& path, int page, const std::string& outPath) {
+    File in = OpenFile(path, "rb");
+    if (!in) return 1;
+    Job job;
+    job->sourceKind = ZAN_SOURCE_FILE;
+    job->sourceFp = in.get();
+    job->pageNumber = page;
+    job->outputBitsPerSample = 16;
+    if (!zanTIFFGetInfo(job.get())) return 1;
+    // Room for the longest line any page kind gives: 16-bit samples, or
+    // three bytes a pixel for palette and JPEG pages.
+    const uint64_t room = uint64_t{job->imageWidth} * std::max<uint32_t>(job->samplesPerPixel, 3) * 2 + 16;
+    if (room > 0xFFFFFFFFu) {
+        std::fprintf(stderr, "zantiff: the page's lines are too long\n");
+        return 1;
+    }
+    std::vector<uint8_t> line(static_cast<size_t>(room));
+    uint32_t got = zanTIFFReadNextScanLine(job.get(), line.data(), static_cast<uint32_t>(line.size()));
+    if (!got) return 1;
+    ImageLayout layout = LayoutOf(job.get());
+    const bool whiteIsZero = job->imageType == ZAN_IMAGE_BILEVEL_WHITE_IS_ZERO ||
+                             job->imageType == ZAN_IMAGE_GREY_WHITE_IS_ZERO;
+    File out = OpenFile(outPath, "wb");
+    if (!out) return 1;
+    auto writer = NeedsPam(job.get(), layout) ? StartPam(out.get(), layout) : StartPng(out.get(), layout);
+    if (!writer) {
+        std::fprintf(stderr, "zantiff: no PNG or PAM form for this page's lines\n");
+        return 1;
+    }
+    std::vector<uint8_t> interleaved(line.size());
+    Progress progress("decode: row");
+    for (uint32_t row = 0;; ++row) {
+        if (whiteIsZero) InvertGrey(line, got, layout, job->planarConfig == 2);
+        const bool planar = job->planarConfig == 2 && layout.channels > 1;
+        if (planar) Interleave(line, interleaved, layout);
+        if (!writer->WriteRow(planar ? interleaved.data() : line.data())) return 1;
+        if (row % 256 == 0) progress.Update(row + 1, layout.height);
+        if (row + 1 == layout.height) break;
+        got = zanTIFFReadNextScanLine(job.get(), line.data(), static_cast<uint32_t>(line.size()));
+        if (!got) return 1;
+    }
+    return writer->Finish() ? 0 : 1;
+}
+
+struct ReadArguments {
+    std::string file, output;
+    int page = 1;
+    bool json = false;
+};
+
+}  // namespace
+
+void AddReadCommands(CLI::App& app, int& status) {
+    static ReadArguments args;
+    auto* info = app.add_subcommand("info", "Describe a page and list its metadata and EXIF tags");
+    info->add_option("FILE", args.file, "TIFF file")->required();
+    info->add_option("-p,--page", args.page, "page number, from 1");
+    info->add_flag("--json", args.json, "print JSON");
+    info->callback([&status] { status = Info(args.file, args.page, args.json); });
+
+    auto* decode = app.add_subcommand("decode", "Write a page's lines as PNG (separated pages as PAM)");
+    decode->add_option("FILE", args.file, "TIFF file")->required();
+    decode->add_option("-p,--page", args.page, "page number, from 1");
+    decode->add_option("-o,--output", args.output, "PNG (or PAM) file to write")->required();
+    decode->callback([&status] { status = Decode(args.file, args.page, args.output); });
+}
+
+}  // namespace zantool

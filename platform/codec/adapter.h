@@ -22,6 +22,7 @@ struct Adapter {
     int ioFailed = 0;              // a client procedure failed (sticky)
     int exifDepth = 0;             // open EXIF brackets
     tdir_t exifBaseDirectory = 0;  // image directory the outer bracket began on
+    uint64_t lastExifOffset = 0;   // EXIF directory written last
 };
 
 // The adapter of a codec object opened by TIFFClientOpenPivlo; null for any

@@ -118,3 +118,57 @@ tdir_t TIFFEXIFBaseDirectoryPivlo(TIFF* tif) {
 }
 
 }  // extern "C"
+
+// ---- EXIF directories written, and writing helpers ----
+
+#include <string>
+
+extern "C" {
+
+int zanCreateTiffEXIFDir(TIFF* tif) {
+    if (!TIFFInEXIFDirPivlo(tif)) return 0;
+    return TIFFCreateEXIFDirectory(tif) == 0;
+}
+
+int TIFFWriteEXIFDirectoryPivlo(TIFF* tif) {
+    osttiff::Adapter* a = osttiff::AdapterOfTiff(tif);
+    uint64_t offset = 0;
+    if (!a || !TIFFWriteCustomDirectory(tif, &offset)) return 0;
+    a->lastExifOffset = offset;
+    return 1;
+}
+
+uint64_t TIFFLastEXIFOffsetPivlo(TIFF* tif) {
+    osttiff::Adapter* a = osttiff::AdapterOfTiff(tif);
+    return a ? a->lastExifOffset : 0;
+}
+
+int TIFFFieldIsSetPivlo(TIFF* tif, uint32_t tag) {
+    if (!TIFFFindField(tif, tag, TIFF_ANY)) return 0;
+    // Room for every shape TIFFGetField delivers: up to three pointers or a
+    // count and a pointer, each slot wide enough for a double.
+    alignas(8) unsigned char slots[4][16];
+    return TIFFGetField(tif, tag, slots[0], slots[1], slots[2], slots[3]) != 0;
+}
+
+int TIFFSetAsciiFieldPivlo(TIFF* tif, uint32_t tag, const char* text) {
+    const TIFFField* field = TIFFFindField(tif, tag, TIFF_ANY);
+    if (!field || TIFFFieldDataType(field) != TIFF_ASCII || !text) return 0;
+    const int count = TIFFFieldWriteCount(field);  // above 1: fixed, the zero included
+    if (count > 1 && std::strlen(text) + 1 != static_cast<size_t>(count)) {
+        std::string fitted(text);
+        fitted.resize(static_cast<size_t>(count) - 1, ' ');
+        return TIFFSetField(tif, tag, fitted.c_str());
+    }
+    return TIFFSetField(tif, tag, text);
+}
+
+const char* TIFFGetVersionLinePivlo(void) {
+    static const std::string line = [] {
+        const std::string full = TIFFGetVersion();
+        return full.substr(0, full.find('\n'));
+    }();
+    return line.c_str();
+}
+
+}  // extern "C"

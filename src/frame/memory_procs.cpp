@@ -140,8 +140,10 @@ int32_t FixedWriteProc(void* client, void* buffer, int32_t n) {
     return static_cast<int32_t>(count);
 }
 
-// The end of a fixed buffer is taken to be the current position: only a
-// zero move from the end is possible.
+// The end of a fixed buffer is the end of the data written into it (its
+// high-water mark, memSize): the codec appends every directory there, also
+// after it has gone back to read or patch an earlier one. Only a zero move
+// from the end is possible.
 uint32_t FixedSeekProc(void* client, uint32_t offset, int whence) {
     ConversionContext* ctx = Ctx(client);
     switch (whence) {
@@ -154,7 +156,9 @@ uint32_t FixedSeekProc(void* client, uint32_t offset, int whence) {
         ctx->destMemPos += offset;
         return static_cast<uint32_t>(FixedOffset(ctx));
     case SEEK_END:
-        return offset == 0 ? static_cast<uint32_t>(FixedOffset(ctx)) : kSeekFailed;
+        if (offset != 0 || ctx->memSize > ctx->destMemoryCapacity) return kSeekFailed;
+        ctx->destMemPos = At(ctx->destMemory, ctx->memSize);
+        return ctx->memSize;
     default:
         return 0;
     }

@@ -10,7 +10,9 @@
 #include "frame/io_procs.h"
 #include "osttiff/osttiff.h"
 #include "pivlo/pivlo.h"
+#include "metadata/metadata_writer.h"
 #include "read/reader_buffers.h"
+#include "write/page_setup.h"
 #include "zantiff/zantiff.h"
 
 namespace zan {
@@ -91,6 +93,18 @@ void HandOverMemoryImage(ConversionContext* ctx) {
 }  // namespace
 
 void ReleaseFileHandle(ConversionContext* ctx) { ReleaseField(ctx, ctx->fileHandle); }
+
+void HandOverResult(ConversionContext* ctx) {
+    if (OwnsMemoryImage(ctx)) HandOverMemoryImage(ctx);
+    else if (ctx->destKind == ZAN_DEST_FIXED_BUFFER && ctx->destSizeOut) *ctx->destSizeOut = ctx->memSize;
+}
+
+void DiscardMemoryImage(ConversionContext* ctx) {
+    if (!OwnsMemoryImage(ctx)) return;
+    ReleaseBlock(ctx, ctx->memBase);
+    ClearMemoryImage(ctx);
+    zanResetWorkBuffer(ctx);
+}
 
 void CloseStreamBuffer(ConversionContext* ctx) {
     if (!ctx->streamBuffer) return;
@@ -192,7 +206,8 @@ extern "C" ZAN_API void zanDestroyTIFF(ConversionContext* ctx) {
     using namespace zan;
     if (!ctx) return;
     if (ctx->state == ZAN_STATE_WRITING && ctx->tiff) {
-        TIFFWriteDirectory(ctx->tiff);
+        // The page in progress is finished as zanTIFFNextImage would.
+        if (WritePageDirectory(ctx) && ctx->writeMetadataList) WriteTIFFMetadata(ctx);
     } else if (ctx->state == ZAN_STATE_READING) {
         // The strip buffer, work line and palette copy of the scanline reader.
         ReleaseReaderBuffers(ctx);
@@ -204,7 +219,5 @@ extern "C" ZAN_API void zanDestroyTIFF(ConversionContext* ctx) {
     }
     RestoreCodecMessages(ctx);
     ReleaseFileHandle(ctx);
-    if (OwnsMemoryImage(ctx)) HandOverMemoryImage(ctx);
-    else if (ctx->destKind == ZAN_DEST_FIXED_BUFFER && ctx->destSizeOut)
-        *ctx->destSizeOut = ctx->memSize;
+    HandOverResult(ctx);
 }

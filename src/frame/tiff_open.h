@@ -20,4 +20,12 @@ void ReleaseFileHandle(ConversionContext* ctx);
 // Closes the job's stream buffer, if any.
 void CloseStreamBuffer(ConversionContext* ctx);
 
+// Hands the growing memory image over to the host (shrunk to its data,
+// through destMemory and destSizeOut) when the job holds one, or reports a
+// fixed buffer's size through destSizeOut; the module holds no image after.
+void HandOverResult(ConversionContext* ctx);
+
+// Gives up a growing memory image the job holds (a failed one-shot write).
+void DiscardMemoryImage(ConversionContext* ctx);
+
 }  // namespace zan

@@ -186,13 +186,14 @@ TEST_F(FixedBufferTest, SeeksStayInsideTheBuffer) {
     EXPECT_EQ(FixedSeekProc(host_.ctx(), 0, 9), 0u);
 }
 
-TEST_F(FixedBufferTest, EndIsTheCurrentPosition) {
+TEST_F(FixedBufferTest, EndIsTheEndOfTheDataWritten) {
     Write("abcdef");
     FixedSeekProc(host_.ctx(), 3, SEEK_SET);
-    EXPECT_EQ(FixedSeekProc(host_.ctx(), 0, SEEK_END), 3u) << "even with data beyond it";
+    EXPECT_EQ(FixedSeekProc(host_.ctx(), 0, SEEK_END), 6u)
+        << "appending after a look back must not overwrite what follows";
+    EXPECT_EQ(FixedSizeProc(host_.ctx()), 6u);
     EXPECT_EQ(FixedSeekProc(host_.ctx(), static_cast<uint32_t>(-1), SEEK_END), kSeekFailed);
     EXPECT_EQ(FixedSeekProc(host_.ctx(), 1, SEEK_END), kSeekFailed);
-    EXPECT_EQ(FixedSizeProc(host_.ctx()), 3u);
 }
 
 TEST_F(FixedBufferTest, BytesSkippedByASeekAreZeroed) {

@@ -114,6 +114,33 @@ OSTTIFF_API int TIFFInEXIFDirPivlo(TIFF* tif);
 /* The image directory (index) current when the bracket began. */
 OSTTIFF_API tdir_t TIFFEXIFBaseDirectoryPivlo(TIFF* tif);
 
+/* Starts an empty EXIF directory (inside a zanBeginTiffEXIFDir bracket) for
+ * TIFFSetField calls; the page's directory is given up, so it must have
+ * been written. 1, or 0 outside a bracket or when libtiff refuses. */
+OSTTIFF_API int zanCreateTiffEXIFDir(TIFF* tif);
+
+/* Writes the EXIF directory made by zanCreateTiffEXIFDir at the end of the
+ * file, outside the chain of pages, and records its offset. 1 or 0. */
+OSTTIFF_API int TIFFWriteEXIFDirectoryPivlo(TIFF* tif);
+
+/* Offset of the EXIF directory written last through this object; 0 when
+ * none was written. */
+OSTTIFF_API uint64_t TIFFLastEXIFOffsetPivlo(TIFF* tif);
+
+/* ---- writing helpers ---- */
+
+/* Nonzero when the current directory holds `tag` (libtiff's presence flag;
+ * the tag's value is fetched into scratch space and dropped). */
+OSTTIFF_API int TIFFFieldIsSetPivlo(TIFF* tif, uint32_t tag);
+
+/* Sets an ASCII field; one of a fixed count (EXIF's DateTimeOriginal,
+ * ImageUniqueID and the like) is padded with spaces or cut to that count,
+ * since readers drop such a field when its count differs. */
+OSTTIFF_API int TIFFSetAsciiFieldPivlo(TIFF* tif, uint32_t tag, const char* text);
+
+/* The first line of TIFFGetVersion(): "LIBTIFF, Version 4.5.0". */
+OSTTIFF_API const char* TIFFGetVersionLinePivlo(void);
+
 /* Blocks of this layer from the host allocator handed to the codec object
  * (the C heap when none was given). */
 OSTTIFF_API void* PivloMalloc(TIFF* tif, uint32_t byteCount);

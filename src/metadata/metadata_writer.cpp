@@ -1,0 +1,91 @@
+// The EXIF directory of a written page. The page's directory has already
+// been written when this runs, so the EXIF directory is written on its own
+// at the end of the file, the page is made current again, and its directory
+// is rewritten with the ExifIFD link (the sequence libtiff 4.5 handles for
+// every page of a multi-page file; the page's first directory becomes
+// unused space).
+
+#include "metadata/metadata_writer.h"
+
+#include "osttiff/osttiff.h"
+#include "pivlo/pivlo.h"
+#include "zantiff/metadata.h"
+
+namespace zan {
+namespace {
+
+bool IsExif(const MetadataEntry* e) { return (e->group & ZAN_METADATA_EXIF) != 0; }
+
+const MetadataEntry* FirstExifEntry(const MetadataList* list) {
+    for (const MetadataEntry* e = list->head; e; e = e->next)
+        if (IsExif(e)) return e;
+    return nullptr;
+}
+
+int Fail(ConversionContext* ctx, const char* message) {
+    zanError(ctx, message);
+    return 0;
+}
+
+// Passes one EXIF entry to the codec; a tag the codec refuses is simply
+// absent from the directory.
+void SetExifEntry(ConversionContext* ctx, TIFF* tif, const MetadataEntry& e) {
+    switch (e.type) {
+    case ZAN_METADATA_BLOCK: {
+        const TIFFField* field = TIFFFindField(tif, e.tag, TIFF_ANY);
+        if (field && TIFFFieldDataType(field) == TIFF_ASCII && !TIFFFieldPassCount(field)) {
+            TIFFSetAsciiFieldPivlo(tif, e.tag, static_cast<const char*>(e.value.block));
+        } else if (e.count) {
+            TIFFSetField(tif, e.tag, e.count, e.value.block);
+        } else if (field && TIFFFieldPassCount(field)) {
+            // A block without a value count, for a field that takes one: its
+            // byte length counts bytes.
+            TIFFSetField(tif, e.tag, e.size, e.value.block);
+        } else {
+            TIFFSetField(tif, e.tag, e.value.block);
+        }
+        break;
+    }
+    case ZAN_METADATA_U8: TIFFSetField(tif, e.tag, static_cast<int>(e.value.u8)); break;
+    case ZAN_METADATA_U16: TIFFSetField(tif, e.tag, static_cast<int>(e.value.u16[0])); break;
+    case ZAN_METADATA_U32: TIFFSetField(tif, e.tag, e.value.u32); break;
+    case ZAN_METADATA_F32: TIFFSetField(tif, e.tag, static_cast<double>(e.value.f32)); break;
+    case ZAN_METADATA_F64: TIFFSetField(tif, e.tag, e.value.f64); break;
+    default: zanWarning(ctx, "Unknown TIFF EXIF type"); break;
+    }
+}
+
+}  // namespace
+
+int WriteTIFFMetadata(ConversionContext* ctx) {
+    TIFF* tif = ctx->tiff;
+    const MetadataList* list = ctx->writeMetadataList;
+    if (!tif || !list) return 1;
+    const MetadataEntry* first = FirstExifEntry(list);
+    if (!first) return 1;
+    // The page just written is the last of the chain. libtiff's own count
+    // of the current directory goes wrong once a directory was rewritten,
+    // so the chain is counted.
+    const tdir_t pages = TIFFNumberOfDirectories(tif);
+    if (pages == 0) return Fail(ctx, "Cannot set TIFF directory");
+    const tdir_t page = pages - 1;
+    zanBeginTiffEXIFDir(tif);
+    if (!zanCreateTiffEXIFDir(tif)) {
+        zanEndTiffEXIFDir(tif);
+        return Fail(ctx, "Cannot create EXIF entry in the TIFF directory");
+    }
+    for (const MetadataEntry* e = first; e; e = e->next)
+        if (IsExif(e)) SetExifEntry(ctx, tif, *e);
+    const bool written = TIFFWriteEXIFDirectoryPivlo(tif) != 0;
+    // Back to the page, whatever happened to the EXIF directory.
+    const bool pageAgain = TIFFSetDirectory(tif, page) != 0;
+    zanEndTiffEXIFDir(tif);
+    if (!written) return Fail(ctx, "TIFF EXIF write error");
+    if (!pageAgain) return Fail(ctx, "Cannot set TIFF directory");
+    if (!TIFFSetField(tif, TIFFTAG_EXIFIFD, TIFFLastEXIFOffsetPivlo(tif)))
+        return Fail(ctx, "Cannot create EXIF entry in the TIFF directory");
+    if (!TIFFRewriteDirectory(tif) || TIFFIOFailedPivlo(tif)) return Fail(ctx, "TIFF EXIF write error");
+    return 1;
+}
+
+}  // namespace zan

@@ -1,0 +1,123 @@
+// zanFrameBufferToTIFF: the host's whole frame as one page in one call,
+// bi-level frames in CCITT Group 4 and all others in PackBits.
+
+#include <algorithm>
+#include <limits>
+
+#include "frame/codec_messages.h"
+#include "frame/host_memory.h"
+#include "frame/tiff_open.h"
+#include "metadata/metadata_writer.h"
+#include "osttiff/osttiff.h"
+#include "pivlo/pivlo.h"
+#include "write/page_setup.h"
+#include "write/page_tags.h"
+#include "zantiff/zantiff.h"
+
+namespace zan {
+namespace {
+
+int Fail(ConversionContext* ctx, const char* message) {
+    zanError(ctx, message);
+    return 0;
+}
+
+// Closes what the call opened: the codec object first (closing may still
+// write), then the file record.
+void CloseJob(ConversionContext* ctx) {
+    RestoreCodecMessages(ctx);
+    if (ctx->tiff) {
+        TIFFClose(ctx->tiff);
+        ctx->tiff = nullptr;
+    }
+    ReleaseFileHandle(ctx);
+}
+
+int FailWrite(ConversionContext* ctx) {
+    CloseJob(ctx);
+    DiscardMemoryImage(ctx);
+    return 0;
+}
+
+void SetPageTags(ConversionContext* ctx, TIFF* tif, const ColourLayout& layout) {
+    TIFFSetField(tif, TIFFTAG_SUBFILETYPE, 0);
+    TIFFSetField(tif, TIFFTAG_IMAGEWIDTH, ctx->frameWidth);
+    TIFFSetField(tif, TIFFTAG_IMAGELENGTH, ctx->frameHeight);
+    TIFFSetField(tif, TIFFTAG_ORIENTATION, ctx->outputOrientation ? ctx->outputOrientation : ORIENTATION_TOPLEFT);
+    TIFFSetField(tif, TIFFTAG_PLANARCONFIG, PLANARCONFIG_CONTIG);
+    TIFFSetField(tif, TIFFTAG_SOFTWARE, TIFFGetVersionLinePivlo());
+    TIFFSetField(tif, TIFFTAG_FILLORDER, FILLORDER_MSB2LSB);
+    const bool bilevel = ctx->colorSpace == ZAN_COLORSPACE_BILEVEL;
+    TIFFSetField(tif, TIFFTAG_BITSPERSAMPLE, layout.bitsPerSample);
+    TIFFSetField(tif, TIFFTAG_SAMPLESPERPIXEL, layout.samplesPerPixel);
+    TIFFSetField(tif, TIFFTAG_PHOTOMETRIC, layout.photometric);
+    TIFFSetField(tif, TIFFTAG_COMPRESSION, bilevel ? COMPRESSION_CCITTFAX4 : COMPRESSION_PACKBITS);
+    if (layout.unassociatedAlpha) {
+        static const uint16_t kUnassociated[1] = {EXTRASAMPLE_UNASSALPHA};
+        TIFFSetField(tif, TIFFTAG_EXTRASAMPLES, 1, kUnassociated);
+    }
+    if (bilevel && ctx->t6OptionsSet) TIFFSetField(tif, TIFFTAG_GROUP4OPTIONS, ctx->t6Options);
+    SetResolution(ctx, tif);
+    SetIccProfile(ctx, tif);
+}
+
+// Each 16-bit (little-endian) sample keeps its high byte; the rows are then
+// packed one after another at the start of the frame.
+void ReduceFrame(uint8_t* frame, uint64_t samples8) {
+    for (uint64_t i = 0; i < samples8; ++i) frame[i] = frame[2 * i + 1];
+}
+
+}  // namespace
+}  // namespace zan
+
+extern "C" ZAN_API int zanFrameBufferToTIFF(ConversionContext* ctx) {
+    using namespace zan;
+    if (!ctx) return 0;
+    const uint32_t space = ctx->colorSpace;
+    if (space != ZAN_COLORSPACE_BILEVEL && space != ZAN_COLORSPACE_GREY && space != ZAN_COLORSPACE_GREY_ALPHA &&
+        space != ZAN_COLORSPACE_RGB_ALPHA && space != ZAN_COLORSPACE_RGB)
+        return Fail(ctx, "Incompatible frame type");
+    if (ctx->outputBitsPerSample == 16 && ctx->bitsPerSample == 8)
+        return Fail(ctx, "Compressing from 8 to 16 bits image is not supported.");
+    if (ctx->outputBitsPerSample == 16 && ctx->bitsPerSample == 1)
+        return Fail(ctx, "Compressing from 1 to 16 bits image is not supported.");
+    const bool sixteen = ctx->bitsPerSample == 16 && ctx->outputBitsPerSample == 16;
+    const bool reduce = ctx->bitsPerSample == 16 && !sixteen;
+    ColourLayout layout;
+    ColourLayoutFor(space, ctx->frameWidth, sixteen, ctx->frameWhiteIsZero != 0, 0, &layout);
+    // The frame must hold every row (twice the bytes when reduced from 16 bits).
+    const uint64_t frameBytes = layout.rowBytes * ctx->frameHeight * (reduce ? 2 : 1);
+    if (ctx->frameWidth == 0 || ctx->frameHeight == 0 || !ctx->frameData)
+        return Fail(ctx, "Image dimension can not be zero.");
+    if (frameBytes > std::numeric_limits<uint32_t>::max() ||
+        (ctx->frameBufferSize != 0 && ctx->frameBufferSize < frameBytes))
+        return Fail(ctx, "Frame buffer too small for the frame described.");
+
+    zanResetWorkBuffer(ctx);
+    if (!OpenTIFFForWriting(ctx)) return 0;
+    TIFF* tif = ctx->tiff;
+    SetPageTags(ctx, tif, layout);
+    auto* frame = static_cast<uint8_t*>(ctx->frameData);
+    if (reduce) ReduceFrame(frame, layout.rowBytes * ctx->frameHeight);
+    const uint32_t rowsPerStrip = std::max<uint32_t>(1, TIFFDefaultStripSize(tif, 0xFFFFFFFFu));
+    TIFFSetField(tif, TIFFTAG_ROWSPERSTRIP, rowsPerStrip);
+    if (ctx->writeMetadataList) ApplyPageMetadata(ctx, tif);
+
+    for (uint32_t row = 0; row < ctx->frameHeight; row += rowsPerStrip) {
+        const uint32_t rows = std::min(rowsPerStrip, ctx->frameHeight - row);
+        const uint8_t* data = frame + uint64_t{row} * layout.rowBytes;
+        if (TIFFWriteEncodedStrip(tif, row / rowsPerStrip, const_cast<uint8_t*>(data),
+                                  static_cast<tmsize_t>(uint64_t{rows} * layout.rowBytes)) == -1)
+            return FailWrite(ctx);
+    }
+    if (!WritePageDirectory(ctx)) return FailWrite(ctx);
+    if (ctx->writeMetadataList) WriteTIFFMetadata(ctx);
+    const bool failedWrite = TIFFIOFailedPivlo(tif) != 0;
+    CloseJob(ctx);
+    if (failedWrite) {
+        DiscardMemoryImage(ctx);
+        return Fail(ctx, "Unable to write the page to the destination.");
+    }
+    HandOverResult(ctx);
+    return 1;
+}

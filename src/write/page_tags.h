@@ -1,0 +1,37 @@
+// Tags the page writers share: the colour layout of a page by the host's
+// colour-space code, resolution and ICC profile.
+#pragma once
+
+#include <cstdint>
+
+#include <tiffio.h>
+
+#include "zantiff/conversion_context.h"
+
+namespace zan {
+
+// How a page of one host colour space is stored, and the bytes of a row.
+struct ColourLayout {
+    uint16_t bitsPerSample = 8;
+    uint16_t samplesPerPixel = 1;
+    uint16_t photometric = PHOTOMETRIC_MINISBLACK;
+    bool unassociatedAlpha = false;  // ExtraSamples {2}
+    uint64_t rowBytes = 0;
+};
+
+// The layout of colour-space code `colorSpace` (1..8) for rows of `width`
+// pixels; `sixteen` asks for 16-bit samples. False for codes outside 1..8.
+bool ColourLayoutFor(uint32_t colorSpace, uint32_t width, bool sixteen, bool whiteIsZero,
+                     uint32_t components, ColourLayout* layout);
+
+// BitsPerSample, SamplesPerPixel, PhotometricInterpretation and, for alpha,
+// ExtraSamples, in that order.
+void SetColourTags(TIFF* tif, const ColourLayout& layout);
+
+// ResolutionUnit inch always; the resolutions when both are above 0.
+void SetResolution(ConversionContext* ctx, TIFF* tif);
+
+// The ICC profile, when the context has one.
+void SetIccProfile(ConversionContext* ctx, TIFF* tif);
+
+}  // namespace zan

@@ -23,13 +23,14 @@ int Fail(ConversionContext* ctx, const char* message) {
 }
 
 // Closes what the call opened: the codec object first (closing may still
-// write), then the file record.
+// write, and what it reports still reaches the host), then the handlers
+// and the file record.
 void CloseJob(ConversionContext* ctx) {
-    RestoreCodecMessages(ctx);
     if (ctx->tiff) {
         TIFFClose(ctx->tiff);
         ctx->tiff = nullptr;
     }
+    RestoreCodecMessages(ctx);
     ReleaseFileHandle(ctx);
 }
 

@@ -32,18 +32,17 @@ int Fail(ConversionContext* ctx, const char* message) {
 void SetExifEntry(ConversionContext* ctx, TIFF* tif, const MetadataEntry& e) {
     switch (e.type) {
     case ZAN_METADATA_BLOCK: {
+        // The field's description decides the form: a count goes with the
+        // block only for a field that takes one (a fixed-size array such as
+        // LensSpecification takes the block alone, whatever the entry's count).
         const TIFFField* field = TIFFFindField(tif, e.tag, TIFF_ANY);
-        if (field && TIFFFieldDataType(field) == TIFF_ASCII && !TIFFFieldPassCount(field)) {
+        if (!field) break;  // unknown to the codec: absent from the directory
+        if (TIFFFieldDataType(field) == TIFF_ASCII && !TIFFFieldPassCount(field))
             TIFFSetAsciiFieldPivlo(tif, e.tag, static_cast<const char*>(e.value.block));
-        } else if (e.count) {
-            TIFFSetField(tif, e.tag, e.count, e.value.block);
-        } else if (field && TIFFFieldPassCount(field)) {
-            // A block without a value count, for a field that takes one: its
-            // byte length counts bytes.
-            TIFFSetField(tif, e.tag, e.size, e.value.block);
-        } else {
+        else if (TIFFFieldPassCount(field))
+            TIFFSetField(tif, e.tag, e.count ? e.count : e.size, e.value.block);
+        else
             TIFFSetField(tif, e.tag, e.value.block);
-        }
         break;
     }
     case ZAN_METADATA_U8: TIFFSetField(tif, e.tag, static_cast<int>(e.value.u8)); break;

@@ -11,4 +11,7 @@ void AddPageCommands(CLI::App& app, int& status);
 // info, decode
 void AddReadCommands(CLI::App& app, int& status);
 
+// encode, copy
+void AddWriteCommands(CLI::App& app, int& status);
+
 }  // namespace zantool

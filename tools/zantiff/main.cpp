@@ -44,6 +44,7 @@ int main(int argc, char** argv) {
     app.require_subcommand(0, 1);
     int status = 0;
     zantool::AddReadCommands(app, status);
+    zantool::AddWriteCommands(app, status);
     zantool::AddPageCommands(app, status);
     try {
         app.parse(argc, argv);

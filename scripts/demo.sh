@@ -18,4 +18,7 @@ run decode "$sample" --page 2 -o "$out/page2.png"
 run split "$sample" -o "$out/page"
 run extract "$sample" 3 -o "$out/third.tif"
 run info "$out/third.tif"
+run encode "$out/page1.png" "$out/page2.png" -o "$out/encoded.tif" --compression lzw --dpi 300
+run copy "$sample" -o "$out/copy.tif" --compression deflate
+run info "$out/copy.tif" --page 2
 ls -l "$out"

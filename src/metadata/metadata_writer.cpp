@@ -7,6 +7,7 @@
 
 #include "metadata/metadata_writer.h"
 
+#include "metadata/entry_forms.h"
 #include "osttiff/osttiff.h"
 #include "pivlo/pivlo.h"
 #include "zantiff/metadata.h"
@@ -30,17 +31,25 @@ int Fail(ConversionContext* ctx, const char* message) {
 // Passes one EXIF entry to the codec; a tag the codec refuses is simply
 // absent from the directory.
 void SetExifEntry(ConversionContext* ctx, TIFF* tif, const MetadataEntry& e) {
+    const bool known = e.type == ZAN_METADATA_BLOCK || e.type == ZAN_METADATA_U8 || e.type == ZAN_METADATA_U16 ||
+                       e.type == ZAN_METADATA_U32 || e.type == ZAN_METADATA_F32 || e.type == ZAN_METADATA_F64;
+    if (!known) {
+        zanWarning(ctx, "Unknown TIFF EXIF type");
+        return;
+    }
+    // An entry whose form does not suit its tag's field is not passed: the
+    // codec would read an argument of another kind.
+    if (!EntryFitsField(TIFFFindField(tif, e.tag, TIFF_ANY), e)) return;
     switch (e.type) {
     case ZAN_METADATA_BLOCK: {
         // The field's description decides the form: a count goes with the
         // block only for a field that takes one (a fixed-size array such as
         // LensSpecification takes the block alone, whatever the entry's count).
         const TIFFField* field = TIFFFindField(tif, e.tag, TIFF_ANY);
-        if (!field) break;  // unknown to the codec: absent from the directory
         if (TIFFFieldDataType(field) == TIFF_ASCII && !TIFFFieldPassCount(field))
             TIFFSetAsciiFieldPivlo(tif, e.tag, static_cast<const char*>(e.value.block));
         else if (TIFFFieldPassCount(field))
-            TIFFSetField(tif, e.tag, e.count ? e.count : e.size, e.value.block);
+            TIFFSetField(tif, e.tag, PassedValueCount(field, e), e.value.block);
         else
             TIFFSetField(tif, e.tag, e.value.block);
         break;
@@ -75,6 +84,16 @@ int WriteTIFFMetadata(ConversionContext* ctx) {
     }
     for (const MetadataEntry* e = first; e; e = e->next)
         if (IsExif(e)) SetExifEntry(ctx, tif, *e);
+    // libtiff cannot write an EXIF directory without entries (it fails, or
+    // worse): when the codec took none of them, the page stays without one.
+    // The empty EXIF directory gives way to a fresh image directory for the
+    // next page (the page itself is written and linked already).
+    if (TIFFGetTagListCount(tif) == 0) {
+        TIFFFreeDirectory(tif);
+        TIFFCreateDirectory(tif);
+        zanEndTiffEXIFDir(tif);
+        return 1;
+    }
     const bool written = TIFFWriteEXIFDirectoryPivlo(tif) != 0;
     // Back to the page, whatever happened to the EXIF directory.
     const bool pageAgain = TIFFSetDirectory(tif, page) != 0;

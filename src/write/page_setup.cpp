@@ -7,6 +7,7 @@
 #include <cstdarg>
 
 #include "frame/tiff_open.h"
+#include "metadata/entry_forms.h"
 #include "metadata/metadata_writer.h"
 #include "osttiff/osttiff.h"
 #include "pivlo/pivlo.h"
@@ -26,15 +27,20 @@ bool IsGuarded(uint32_t tag) {
 }
 
 // Passes an entry to the codec in the form its type says; -1 for entries
-// of types that are passed over.
+// of types that are passed over. An entry whose form does not suit the
+// tag's field is refused (0) before the codec could misread it.
 int SetEntry(TIFF* tif, const MetadataEntry& e) {
-    if (e.tag == TIFFTAG_ICCPROFILE) return TIFFSetField(tif, e.tag, e.size, e.value.block);
+    if (e.type != ZAN_METADATA_BLOCK && e.type != ZAN_METADATA_U16 && e.type != ZAN_METADATA_U32 &&
+        e.type != ZAN_METADATA_AS_CODEC && e.type != ZAN_METADATA_F32 && e.type != ZAN_METADATA_F64)
+        return -1;
     const TIFFField* field = TIFFFindField(tif, e.tag, TIFF_ANY);
+    if (!field) return TIFFSetField(tif, e.tag, 0);  // unknown: the codec refuses and says so
+    if (e.tag == TIFFTAG_ICCPROFILE)
+        return e.type == ZAN_METADATA_BLOCK && e.value.block ? TIFFSetField(tif, e.tag, e.size, e.value.block) : 0;
+    if (!EntryFitsField(field, e)) return 0;
     switch (e.type) {
     case ZAN_METADATA_BLOCK:
-        // A field that takes a count gets one: the values, else the bytes.
-        if (field && TIFFFieldPassCount(field))
-            return TIFFSetField(tif, e.tag, e.count ? e.count : e.size, e.value.block);
+        if (TIFFFieldPassCount(field)) return TIFFSetField(tif, e.tag, PassedValueCount(field, e), e.value.block);
         return TIFFSetField(tif, e.tag, e.value.block);
     case ZAN_METADATA_U16:
         return TIFFSetField(tif, e.tag, static_cast<int>(e.value.u16[0]), static_cast<int>(e.value.u16[1]));
@@ -42,7 +48,7 @@ int SetEntry(TIFF* tif, const MetadataEntry& e) {
     case ZAN_METADATA_AS_CODEC:
         // As the codec delivered it: a double for fields that hold doubles
         // (SMinSampleValue, SMaxSampleValue), a 32-bit integer otherwise.
-        if (field && TIFFFieldSetGetSize(field) == 8) return TIFFSetField(tif, e.tag, e.value.f64);
+        if (TIFFFieldSetGetSize(field) == 8) return TIFFSetField(tif, e.tag, e.value.f64);
         return TIFFSetField(tif, e.tag, e.value.u32);
     case ZAN_METADATA_F32: return TIFFSetField(tif, e.tag, static_cast<double>(e.value.f32));
     case ZAN_METADATA_F64: return TIFFSetField(tif, e.tag, e.value.f64);

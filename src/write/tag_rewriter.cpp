@@ -9,6 +9,7 @@
 #include "frame/codec_messages.h"
 #include "frame/host_memory.h"
 #include "frame/io_procs.h"
+#include "metadata/entry_forms.h"
 #include "osttiff/osttiff.h"
 #include "pivlo/pivlo.h"
 #include "zantiff/zantiff.h"
@@ -17,12 +18,6 @@ namespace zan {
 namespace {
 
 enum class EntryResult { Applied, Skipped, Failed };
-
-// The tags whose two values the codec takes as two separate arguments.
-bool IsPairTag(uint32_t tag) {
-    return tag == TIFFTAG_PAGENUMBER || tag == TIFFTAG_HALFTONEHINTS || tag == TIFFTAG_DOTRANGE ||
-           tag == TIFFTAG_YCBCRSUBSAMPLING;
-}
 
 // Tags whose codec form is not one array (ColorMap takes three, and
 // TransferFunction one per colour channel): a single array would make the

@@ -49,13 +49,14 @@ public:
         value.u16[0] = v;
         Scalar(group, tag, ZAN_METADATA_U16, value, group == ZAN_METADATA_EXIF ? 2 : 1);
     }
-    void Array16(uint32_t tag, std::vector<uint16_t> values) {
+    // With `counted` false the entry gives only the block's byte length.
+    void Array16(uint32_t tag, std::vector<uint16_t> values, bool counted = true) {
         MetadataEntry e{};
         e.group = ZAN_METADATA_EXIF;
         e.tag = tag;
         e.type = ZAN_METADATA_BLOCK;
-        e.count = static_cast<uint32_t>(values.size());
-        e.size = e.count * 2;
+        e.size = static_cast<uint32_t>(values.size() * 2);
+        e.count = counted ? static_cast<uint32_t>(values.size()) : 0;
         e.value.block = list_->allocProc(e.size);
         std::memcpy(e.value.block, values.data(), e.size);
         zanAddToMetadataList(nullptr, list_, &e);
@@ -195,6 +196,45 @@ TEST(PageMetadata, ExifEntryOfAnUnknownTypeIsWarnedAbout) {
     PageReader page(job.Finish());
     uint64_t offset = 0;
     ASSERT_TRUE(TIFFGetField(page.get(), TIFFTAG_EXIFIFD, &offset));
+}
+
+// One grey page with the EXIF entries of `fill`; the page's bytes.
+template <typename Fill> Bytes PageWithExif(Fill fill) {
+    WriteJob job;
+    Metadata metadata;
+    fill(metadata);
+    job->writeMetadataList = metadata.get();
+    job.Describe(2, 8, 2, 1);
+    EXPECT_TRUE(job.WriteRows(PatternRows(2, 8)));
+    EXPECT_EQ(zanTIFFNextImage(job.host().ctx()), 1);
+    job->writeMetadataList = nullptr;
+    EXPECT_TRUE(job.host().Errors().empty());
+    return job.Finish();
+}
+
+TEST(PageMetadata, ExifEntriesUnfitForTheirTagAreLeftOut) {
+    const Bytes tiff = PageWithExif([](Metadata& m) {
+        m.Array16(EXIFTAG_ISOSPEEDRATINGS, {100, 200, 400}, false);  // values counted from the bytes
+        m.Short(ZAN_METADATA_EXIF, EXIFTAG_DATETIMEORIGINAL, 7);     // a number for a text
+        m.Text(ZAN_METADATA_EXIF, EXIFTAG_EXPOSUREPROGRAM, "2");     // a text for a number
+    });
+    PageReader page(tiff);
+    uint64_t offset = 0;
+    ASSERT_TRUE(TIFFGetField(page.get(), TIFFTAG_EXIFIFD, &offset));
+    ASSERT_TRUE(TIFFReadEXIFDirectory(page.get(), offset));
+    uint16_t count = 0, *iso = nullptr;
+    ASSERT_TRUE(TIFFGetField(page.get(), EXIFTAG_ISOSPEEDRATINGS, &count, &iso));
+    ASSERT_EQ(count, 3);
+    EXPECT_EQ(iso[2], 400);
+    char* text = nullptr;
+    EXPECT_FALSE(TIFFGetField(page.get(), EXIFTAG_DATETIMEORIGINAL, &text));
+    uint16_t program = 0;
+    EXPECT_FALSE(TIFFGetField(page.get(), EXIFTAG_EXPOSUREPROGRAM, &program));
+
+    const Bytes none = PageWithExif([](Metadata& m) { m.Short(ZAN_METADATA_EXIF, EXIFTAG_DATETIMEORIGINAL, 7); });
+    PageReader plain(none);
+    EXPECT_FALSE(TIFFGetField(plain.get(), TIFFTAG_EXIFIFD, &offset)) << "nothing taken, no EXIF directory";
+    EXPECT_EQ(DecodeWithLibtiff(none).size(), 1u);
 }
 
 TEST(PageMetadata, ListWithoutExifLeavesThePageAsWritten) {

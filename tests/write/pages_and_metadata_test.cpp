@@ -261,19 +261,6 @@ TEST(Destinations, FixedBufferTooSmallFailsWithoutOverflow) {
     EXPECT_LE(job.size(), 300u);
 }
 
-TEST(Destinations, CallbackDestinationWithoutReadBackStopsAtTheSecondPage) {
-    WriteJob job(Dest::Callbacks);
-    job->sourceReadProc = nullptr;
-    job.Describe(2, 8, 2, 1);
-    ASSERT_TRUE(job.WriteRows(PatternRows(2, 8)));
-    ASSERT_EQ(zanTIFFNextImage(job.host().ctx()), 1);
-    ASSERT_TRUE(job.WriteRows(PatternRows(2, 8)));
-    EXPECT_EQ(zanTIFFNextImage(job.host().ctx()), 0);
-    EXPECT_TRUE(job.host().HasError(
-        "Destination cannot be read back: a source read function is needed to add a page"));
-    EXPECT_GE(DecodeWithLibtiff(job.Finish()).size(), 1u);
-}
-
 TEST(Destinations, AppendedPagesCarryTheirExifToo) {
     const Bytes first = ThreePages(Dest::Memory, true);
     TempFile file;

@@ -145,6 +145,11 @@ constexpr uint32_t kMaxOffset = std::numeric_limits<uint32_t>::max();
 // value size, so that a chunk never splits a value).
 constexpr size_t kCopyBufferSize = 64 * 1024;
 
+// Strips that lie in ascending order with gaps of at most kRunGap bytes
+// are read together, up to this many bytes a run.
+constexpr uint32_t kRunBufferSize = 1024 * 1024;
+constexpr uint32_t kRunGap = 4096;
+
 // Kind of directory being copied: the page itself, or one its pointer
 // entries lead to (EXIF and GPS from the page, Interoperability from EXIF).
 enum class DirKind { Page, Exif, Gps, Interop };
@@ -197,10 +202,32 @@ public:
     }
     bool present() const { return data_ != nullptr; }
     uint32_t& operator[](uint32_t i) { return data_[i]; }
+    uint32_t operator[](uint32_t i) const { return data_[i]; }
 
 private:
     ConversionContext* ctx_;
     uint32_t* data_ = nullptr;
+};
+
+// A byte buffer from the job's allocator.
+class ByteBuffer {
+public:
+    explicit ByteBuffer(ConversionContext* ctx) : ctx_(ctx) {}
+    ByteBuffer(const ByteBuffer&) = delete;
+    ByteBuffer& operator=(const ByteBuffer&) = delete;
+    ~ByteBuffer() { ReleaseBlock(ctx_, data_); }
+    bool Allocate(uint32_t size) {
+        data_ = static_cast<unsigned char*>(AllocateBlock(ctx_, size));
+        size_ = data_ ? size : 0;
+        return data_ != nullptr;
+    }
+    unsigned char* data() const { return data_; }
+    uint32_t size() const { return size_; }
+
+private:
+    ConversionContext* ctx_;
+    unsigned char* data_ = nullptr;
+    uint32_t size_ = 0;
 };
 
 class PageCopier {
@@ -209,7 +236,7 @@ public:
                FILE* dest, ByteOrder destOrder, const PageCopyOptions& options)
         : ctx_(ctx), source_(source), sourceSize_(sourceSize), in_(ctx, sourceOrder),
           destFile_(dest), dest_(dest), out_(ctx, destOrder), options_(options), offsets_(ctx),
-          byteCounts_(ctx), newOffsets_(ctx) {}
+          byteCounts_(ctx), newOffsets_(ctx), runIn_(ctx), runOut_(ctx) {}
 
     int Copy(uint32_t ifd, uint32_t position, PageCopyResult* result) {
         uint64_t bound = position;
@@ -230,21 +257,29 @@ private:
         return 0;
     }
 
-    bool ReadEntry(uint32_t ifd, uint32_t index, Entry* e) {
-        if (!source_.Read(uint64_t{ifd} + 2 + 12u * uint64_t{index}, e->raw, 12)) return false;
-        e->tag = in_.Get16(e->raw);
-        e->type = in_.Get16(e->raw + 2);
-        e->count = in_.Get32(e->raw + 4);
-        e->byteSize = uint64_t{e->count} * TypeSize(e->type, options_.acceptIfdType);
-        e->value = in_.Get32(e->raw + 8);
-        return true;
+    // Reads the directory at `ifd` at once: its entry count into `count`,
+    // its entries and next-directory link into `image`. Reports `beyond`
+    // when the directory does not lie wholly inside the source.
+    bool LoadDirectory(uint32_t ifd, ByteBuffer& image, uint16_t* count, const char* beyond) {
+        unsigned char bytes[2];
+        if (uint64_t{ifd} + 2 > sourceSize_ || !source_.Read(ifd, bytes, 2)) return Fail(beyond);
+        *count = in_.Get16(bytes);
+        const uint32_t size = 12u * *count + 4;
+        if (uint64_t{ifd} + 2 + size > sourceSize_) return Fail(beyond);
+        if (!image.Allocate(size)) return Fail("Memory allocation error.");
+        return source_.Read(uint64_t{ifd} + 2, image.data(), size) || Fail(beyond);
     }
 
-    bool ReadCount(uint32_t ifd, uint16_t* count) {
-        unsigned char bytes[2];
-        if (uint64_t{ifd} + 2 > sourceSize_ || !source_.Read(ifd, bytes, 2)) return false;
-        *count = in_.Get16(bytes);
-        return uint64_t{ifd} + 2 + 12u * uint64_t{*count} + 4 <= sourceSize_;
+    // Entry `index` of a directory loaded by LoadDirectory.
+    Entry EntryAt(const ByteBuffer& image, uint32_t index) const {
+        Entry e;
+        std::memcpy(e.raw, image.data() + 12u * index, 12);
+        e.tag = in_.Get16(e.raw);
+        e.type = in_.Get16(e.raw + 2);
+        e.count = in_.Get32(e.raw + 4);
+        e.byteSize = uint64_t{e.count} * TypeSize(e.type, options_.acceptIfdType);
+        e.value = in_.Get32(e.raw + 8);
+        return e;
     }
 
     static bool IsOffsets(const Entry& e) { return e.tag == kStripOffsets || e.tag == kTileOffsets; }
@@ -324,7 +359,12 @@ private:
         for (uint32_t i = 0; i < stripCount_; ++i)
             if (uint64_t{offsets_[i]} + byteCounts_[i] > sourceSize_)
                 return Fail("Source strip data lie beyond the end of the file.");
-        if (!newOffsets_.Allocate(stripCount_)) return Fail("Memory allocation error.");
+        // The run buffers need hold no more than the page's data with a pad
+        // byte a strip.
+        const auto runSize = static_cast<uint32_t>(
+            std::min<uint64_t>(kRunBufferSize, totalBytes_ + uint64_t{stripCount_} + 1));
+        if (!newOffsets_.Allocate(stripCount_) || !runIn_.Allocate(runSize) || !runOut_.Allocate(runSize))
+            return Fail("Memory allocation error.");
         *bound += 4 * uint64_t{stripCount_} + 1 + totalBytes_ + stripCount_;
         return true;
     }
@@ -332,11 +372,12 @@ private:
     // First pass over a directory: every check, no writing.
     bool Inspect(uint32_t ifd, DirKind kind, uint64_t* bound) {
         uint16_t count = 0;
-        if (!ReadCount(ifd, &count)) return Fail("Source directory lies beyond the end of the file.");
+        ByteBuffer directory(ctx_);
+        if (!LoadDirectory(ifd, directory, &count, "Source directory lies beyond the end of the file."))
+            return false;
         *bound = Even(*bound) + 2 + 12u * uint64_t{count} + 4;
         for (uint32_t i = 0; i < count; ++i) {
-            Entry e;
-            if (!ReadEntry(ifd, i, &e)) return Fail("Source directory lies beyond the end of the file.");
+            const Entry e = EntryAt(directory, i);
             if (TypeSize(e.type, options_.acceptIfdType) == 0) return Fail("Unhandled TIFF TYPE.");
             if (kind == DirKind::Page && (IsOffsets(e) || IsByteCounts(e)) && !InspectStripEntry(e))
                 return false;
@@ -432,6 +473,13 @@ private:
                 return Fail("Unable to write to destination file.");
             done += chunk;
         }
+        // The pad byte that keeps the next item on a word boundary is written
+        // rather than skipped: a seek on the destination stream would flush
+        // and refill its buffer for every odd-sized strip.
+        if (n & 1) {
+            static const unsigned char kPad = 0;
+            if (!dest_.Write(data_ + n, &kPad, 1)) return Fail("Unable to write to destination file.");
+        }
         data_ = Even(data_ + n);
         return true;
     }
@@ -473,29 +521,29 @@ private:
     }
 
     // Writes the directory at `ifd` to `at` (even) with everything it holds;
-    // data_ must lie at or behind the directory's end.
+    // data_ must lie at or behind the directory's end. The directory is
+    // composed in memory and written last, in one piece, after its values,
+    // the directories it points to and (for a page) the strips.
     bool WriteDirectory(uint32_t ifd, uint32_t at, DirKind kind, PageCopyResult* result) {
         uint16_t count = 0;
-        if (!ReadCount(ifd, &count)) return Fail("Error reading the source file.");
-        unsigned char head[2];
-        out_.Put16(count, head);
-        if (!WriteAt(at, head, 2)) return false;
-        const uint64_t entriesAt = uint64_t{at} + 2;
-        data_ = std::max<uint64_t>(data_, entriesAt + 12u * uint64_t{count} + 4);
+        ByteBuffer source(ctx_), image(ctx_);
+        if (!LoadDirectory(ifd, source, &count, "Error reading the source file.")) return false;
+        const uint32_t entriesSize = 12u * count;
+        if (!image.Allocate(2 + entriesSize + 4)) return Fail("Memory allocation error.");
+        unsigned char* const entries = image.data() + 2;
+        out_.Put16(count, image.data());
+        std::memset(entries + entriesSize, 0, 4);  // the copy ends its own chain
+        data_ = std::max<uint64_t>(data_, uint64_t{at} + 2 + entriesSize + 4);
         Entry offsetsEntry;
-        uint64_t offsetsSlot = 0;
+        unsigned char* offsetsRaw = nullptr;
         for (uint32_t i = 0; i < count; ++i) {
-            Entry e;
-            if (!ReadEntry(ifd, i, &e)) return Fail("Error reading the source file.");
-            const uint64_t slot = entriesAt + 12u * uint64_t{i};
-            unsigned char raw[12];
+            const Entry e = EntryAt(source, i);
+            unsigned char* const raw = entries + 12u * i;
             DirKind sub;
             if (kind == DirKind::Page && IsOffsets(e)) {
                 offsetsEntry = e;
-                offsetsSlot = slot;
-                continue;  // filled in once the strips have their places
-            }
-            if (e.byteSize <= 4 && SubDirectoryOf(kind, e, &sub)) {
+                offsetsRaw = raw;  // filled in once the strips have their places
+            } else if (e.byteSize <= 4 && SubDirectoryOf(kind, e, &sub)) {
                 const uint64_t subAt = Even(data_);
                 data_ = subAt;
                 if (!WriteDirectory(e.value, static_cast<uint32_t>(subAt), sub, nullptr)) return false;
@@ -509,25 +557,20 @@ private:
                 PutEntryHead(e, e.type, raw);
                 out_.Put32(static_cast<uint32_t>(valueAt), raw + 8);
             }
-            if (!WriteAt(slot, raw, 12)) return false;
         }
-        const uint64_t nextField = entriesAt + 12u * uint64_t{count};
-        const unsigned char end[4] = {0, 0, 0, 0};
-        if (!WriteAt(nextField, end, 4)) return false;
-        if (kind != DirKind::Page) return true;
-
-        unsigned char link[4];
-        if (!source_.Read(uint64_t{ifd} + 2 + 12u * uint64_t{count}, link, 4))
-            return Fail("Error reading the source file.");
-        result->nextIfd = in_.Get32(link);
-        result->nextIfdField = static_cast<uint32_t>(nextField);
-        return !offsets_.present() || WriteStrips(offsetsEntry, offsetsSlot);
+        if (kind == DirKind::Page) {
+            result->nextIfd = in_.Get32(source.data() + entriesSize);
+            result->nextIfdField = at + 2 + entriesSize;
+            if (offsetsRaw && !WriteStrips(offsetsEntry, offsetsRaw)) return false;
+        }
+        return WriteAt(at, image.data(), 2 + entriesSize + 4);
     }
 
-    // Copies the strips to the data area and writes the offsets entry (and
-    // array) pointing at their new places. SHORT offsets become LONG when the
-    // new ones might not fit in 16 bits.
-    bool WriteStrips(const Entry& e, uint64_t slot) {
+    // Gives every strip its place behind the data position, each at an
+    // even offset, writes the offsets (inline in `raw`, the offsets entry,
+    // or as an array ahead of the strips) and copies the strips. SHORT
+    // offsets become LONG when the new ones might not fit in 16 bits.
+    bool WriteStrips(const Entry& e, unsigned char* raw) {
         uint16_t type = offsetsType_;
         uint64_t byteSize = offsetsByteSize_;
         if (type == kShort && data_ + 4 * (uint64_t{stripCount_} + 128) + totalBytes_ > 65535) {
@@ -535,24 +578,78 @@ private:
             byteSize *= 2;
         }
         const uint64_t arrayAt = data_;
-        if (byteSize > 4) data_ = Even(data_ + byteSize);
+        uint64_t place = byteSize > 4 ? Even(data_ + byteSize) : data_;
         for (uint32_t i = 0; i < stripCount_; ++i) {
-            newOffsets_[i] = static_cast<uint32_t>(data_);
-            if (!CopyData(offsets_[i], byteCounts_[i], 0, sampleSwapUnit_)) return false;
+            newOffsets_[i] = static_cast<uint32_t>(place);
+            place = Even(place + byteCounts_[i]);
         }
-        unsigned char raw[12];
         PutEntryHead(e, type, raw);
         const uint32_t width = type == kShort ? 2 : 4;
         if (byteSize > 4) {
             out_.Put32(static_cast<uint32_t>(arrayAt), raw + 8);
-            if (!WriteAt(slot, raw, 12)) return false;
-            return WriteOffsetsArray(arrayAt, width);
+            if (!WriteOffsetsArray(arrayAt, width)) return false;
+            data_ = Even(data_ + byteSize);
+        } else {
+            for (uint32_t i = 0; i < stripCount_ && i < 4 / width; ++i) {
+                if (width == 2) out_.Put16(static_cast<uint16_t>(newOffsets_[i]), raw + 8 + 2 * i);
+                else out_.Put32(newOffsets_[i], raw + 8);
+            }
         }
-        for (uint32_t i = 0; i < stripCount_ && i < 4 / width; ++i) {
-            if (width == 2) out_.Put16(static_cast<uint16_t>(newOffsets_[i]), raw + 8 + 2 * i);
-            else out_.Put32(newOffsets_[i], raw + 8);
+        return CopyStrips();
+    }
+
+    // Copies the strips in index order to the places WriteStrips gave them
+    // (from the data position on, each at an even offset). Strips that lie close together in ascending order are
+    // read as one run and written, with their pad bytes, as one piece, so
+    // that a page of many small strips costs a few large reads and writes
+    // rather than several stream calls a strip. A strip too large for the
+    // buffers goes through CopyData on its own.
+    bool CopyStrips() {
+        for (uint32_t i = 0; i < stripCount_;) {
+            if (uint64_t{byteCounts_[i]} + 1 > runOut_.size()) {
+                if (!CopyData(offsets_[i], byteCounts_[i], 0, sampleSwapUnit_)) return false;
+                ++i;
+                continue;
+            }
+            const uint32_t end = RunEnd(i);
+            if (!CopyRun(i, end)) return false;
+            i = end;
         }
-        return WriteAt(slot, raw, 12);
+        return true;
+    }
+
+    // The strip after the last of the run that starts at strip `first`.
+    uint32_t RunEnd(uint32_t first) const {
+        const uint64_t start = offsets_[first];
+        uint64_t readEnd = start + byteCounts_[first];
+        uint64_t written = Even(byteCounts_[first]);
+        uint32_t next = first + 1;
+        for (; next < stripCount_; ++next) {
+            const uint64_t at = offsets_[next], size = byteCounts_[next];
+            if (at < readEnd || at - readEnd > kRunGap) break;
+            if (at + size - start > runIn_.size() || written + Even(size) > runOut_.size()) break;
+            readEnd = at + size;
+            written += Even(size);
+        }
+        return next;
+    }
+
+    bool CopyRun(uint32_t first, uint32_t end) {
+        const uint64_t start = offsets_[first];
+        const uint64_t readSize = uint64_t{offsets_[end - 1]} + byteCounts_[end - 1] - start;
+        if (!source_.Read(start, runIn_.data(), static_cast<size_t>(readSize)))
+            return Fail("Error reading the source file.");
+        const uint64_t runAt = data_;
+        unsigned char* out = runOut_.data();
+        for (uint32_t i = first; i < end; ++i) {
+            const uint32_t size = byteCounts_[i];
+            std::memcpy(out, runIn_.data() + (offsets_[i] - start), size);
+            if (sampleSwapUnit_ > 1) SwapSamples(out, size, sampleSwapUnit_);
+            if (size & 1) out[size] = 0;  // the pad byte, written rather than skipped
+            out += Even(size);
+            data_ = Even(data_ + size);
+        }
+        return WriteAt(runAt, runOut_.data(), static_cast<size_t>(data_ - runAt));
     }
 
     bool WriteOffsetsArray(uint64_t at, uint32_t width) {
@@ -579,6 +676,7 @@ private:
     PageCopyOptions options_;
 
     NumberArray offsets_, byteCounts_, newOffsets_;
+    ByteBuffer runIn_, runOut_;  // strip runs as read and as written
     uint32_t stripCount_ = 0;
     bool stripCountKnown_ = false;
     uint16_t offsetsType_ = 0;

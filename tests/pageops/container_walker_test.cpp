@@ -2,6 +2,10 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
+
+#include <tiffio.h>
+
 #include "pageops_support.h"
 #include "support/tiff_builder.h"
 
@@ -161,6 +165,44 @@ TEST(PageCopy, LongValuesAreCopiedWhole) {
     page.entries.push_back(AsciiEntry(270, std::string(299, 'v')));  // 300 bytes
     const Bytes out = ExtractFirst(BuildTiff({page}));
     EXPECT_NE(DumpPage(out, 0).tags.find(std::string(299, 'v')), std::string::npos);
+}
+
+// A page whose strips libtiff wrote last first: descending offsets, odd
+// sizes, and one strip larger than a copy run.
+Bytes StripsInReverse(uint32_t width, uint32_t height, uint32_t rowsPerStrip) {
+    TempFile file;
+    TIFF* tif = TIFFOpen(file.c_str(), "w");
+    TIFFSetField(tif, TIFFTAG_IMAGEWIDTH, width);
+    TIFFSetField(tif, TIFFTAG_IMAGELENGTH, height);
+    TIFFSetField(tif, TIFFTAG_BITSPERSAMPLE, 8);
+    TIFFSetField(tif, TIFFTAG_SAMPLESPERPIXEL, 1);
+    TIFFSetField(tif, TIFFTAG_PHOTOMETRIC, PHOTOMETRIC_MINISBLACK);
+    TIFFSetField(tif, TIFFTAG_ROWSPERSTRIP, rowsPerStrip);
+    const uint32_t strips = (height + rowsPerStrip - 1) / rowsPerStrip;
+    for (uint32_t s = strips; s-- > 0;) {
+        const uint32_t rows = std::min(rowsPerStrip, height - s * rowsPerStrip);
+        Bytes data(static_cast<size_t>(width) * rows);
+        for (size_t i = 0; i < data.size(); ++i) data[i] = static_cast<uint8_t>(i * 7 + s);
+        TIFFWriteEncodedStrip(tif, s, data.data(), static_cast<tmsize_t>(data.size()));
+    }
+    TIFFClose(tif);
+    return ReadFileBytes(file.path());
+}
+
+TEST(PageCopy, StripsInAnyOrderAndOfAnySizeLandAtEvenOffsets) {
+    for (const Bytes& source : {StripsInReverse(33, 40, 1), StripsInReverse(33, 40, 3),
+                                StripsInReverse(1501, 1400, 1047)}) {
+        const Bytes out = ExtractFirst(source);
+        ASSERT_FALSE(out.empty());
+        EXPECT_EQ(DecodeWithLibtiff(out)[0].pixels, DecodeWithLibtiff(source)[0].pixels);
+        FoundEntry offsets;
+        ASSERT_TRUE(FindEntry(out, 8, 273, &offsets));
+        for (uint32_t i = 0; i < offsets.count; ++i) {
+            const uint32_t at = offsets.count == 1 ? Get32(out, offsets.valueField)
+                                                   : Get32(out, Get32(out, offsets.valueField) + 4 * i);
+            EXPECT_EQ(at % 2, 0u) << "strip " << i;
+        }
+    }
 }
 
 TEST(PageCopy, DirectoryBeyondTheFileEndsTheWalk) {

@@ -146,9 +146,14 @@ bool GetStoredExtraSamples(const ConversionContext* ctx, TIFF* tif, uint16_t* co
 }
 
 bool SelectPage(TIFF* tif, int32_t pageNumber) {
-    if (pageNumber < 1) return true;
+    // Once the pages have been counted by reading to the end of the chain,
+    // libtiff keeps the last page's fields but has let go of its offset
+    // (TIFFCurrentDirOffset is 0), and lookups in the stored directory
+    // would read the file's header as one. The page is then read again.
+    const bool inPlace = TIFFCurrentDirOffset(tif) != 0;
+    if (pageNumber < 1) return inPlace || TIFFSetDirectory(tif, TIFFCurrentDirectory(tif));
     const auto index = static_cast<tdir_t>(pageNumber - 1);
-    return TIFFCurrentDirectory(tif) == index || TIFFSetDirectory(tif, index);
+    return (inPlace && TIFFCurrentDirectory(tif) == index) || TIFFSetDirectory(tif, index);
 }
 
 int ReadImageDescription(ConversionContext* ctx, TIFF* tif) {

@@ -15,8 +15,8 @@ namespace {
 
 using zan::RedirectCodecMessages;
 using zan::RestoreCodecMessages;
-using zantest::CodecMessage;
 using zantest::TestHost;
+using Messages = std::vector<zantest::CodecMessage>;
 
 constexpr const char* kOverrun = "DANGER OUTPUT MESSAGE BUFFER OVERRUN";
 
@@ -28,158 +28,103 @@ void OuterWarning(const char*, const char*, va_list) { ++gOuterWarnings; }
 
 class CodecMessagesTest : public ::testing::Test {
 protected:
-    void SetUp() override {
-        previousError_ = TIFFSetErrorHandler(OuterError);
-        previousWarning_ = TIFFSetWarningHandler(OuterWarning);
-        gOuterErrors = gOuterWarnings = 0;
-    }
+    void SetUp() override { gOuterErrors = gOuterWarnings = 0; }
     void TearDown() override {
         TIFFSetErrorHandler(previousError_);
         TIFFSetWarningHandler(previousWarning_);
     }
 
 private:
-    TIFFErrorHandler previousError_ = nullptr;
-    TIFFErrorHandler previousWarning_ = nullptr;
+    TIFFErrorHandler previousError_ = TIFFSetErrorHandler(OuterError);
+    TIFFErrorHandler previousWarning_ = TIFFSetWarningHandler(OuterWarning);
 };
 
-TEST_F(CodecMessagesTest, FirstStyleSinksGetModuleAndTextWithCode400) {
-    TestHost host;
-    RedirectCodecMessages(host.ctx());
-    TIFFError("TIFFReadDirectory", "Bad value %d for \"%s\"", 7, "Compression");
-    TIFFWarning("TIFFFetchNormalTag", "Unknown field with tag %u", 33550u);
-    RestoreCodecMessages(host.ctx());
-    EXPECT_EQ(host.codecErrors,
-              (std::vector<CodecMessage>{{-400, "TIFFReadDirectory:Bad value 7 for \"Compression\""}}));
-    EXPECT_EQ(host.codecWarnings,
-              (std::vector<CodecMessage>{{-400, "TIFFFetchNormalTag:Unknown field with tag 33550"}}));
-    EXPECT_EQ(gOuterErrors, 0);
+// "module:text" with code -400 reaches the first-style sinks, or the second
+// style's with the job's user data; a null error sink drops errors, and no
+// handler of the codec's own runs meanwhile.
+TEST_F(CodecMessagesTest, MessagesReachTheSinksOfTheChosenStyle) {
+    enum Style { FirstStyle, SecondStyle, NoErrorSink };
+    for (Style style : {FirstStyle, SecondStyle, NoErrorSink}) {
+        SCOPED_TRACE(style);
+        TestHost host;
+        if (style == SecondStyle) host.UseExSinks();
+        if (style != FirstStyle) host->errorProc = nullptr;  // the first style must not be used
+        RedirectCodecMessages(host.ctx());
+        TIFFError("TIFFReadDirectory", "Bad value %d for \"%s\"", 7, "Compression");
+        TIFFWarning("TIFFFetchNormalTag", "Unknown field with tag %u", 33550u);
+        RestoreCodecMessages(host.ctx());
+        const Messages error{{-400, "TIFFReadDirectory:Bad value 7 for \"Compression\""}};
+        EXPECT_EQ(host.codecErrors, style == NoErrorSink ? Messages{} : error);
+        EXPECT_EQ(host.codecWarnings, (Messages{{-400, "TIFFFetchNormalTag:Unknown field with tag 33550"}}));
+    }
+    EXPECT_EQ(gOuterErrors + gOuterWarnings, 0);
 }
 
-TEST_F(CodecMessagesTest, SecondStyleSinksGetTheUserData) {
-    TestHost host;
-    host.UseExSinks();
-    host->errorProc = nullptr;  // the first style must not be used
-    RedirectCodecMessages(host.ctx());
-    TIFFError("mod", "error");
-    TIFFWarning("mod", "warning");
-    RestoreCodecMessages(host.ctx());
-    EXPECT_EQ(host.codecErrors, (std::vector<CodecMessage>{{-400, "mod:error"}}));
-    EXPECT_EQ(host.codecWarnings, (std::vector<CodecMessage>{{-400, "mod:warning"}}));
+// Restoring puts back the handlers in force before the first redirection,
+// however often the job redirected, and leaves them alone if it never did.
+TEST_F(CodecMessagesTest, RestorePutsBackTheHandlersInForceBeforeRedirection) {
+    for (int redirections : {0, 1, 2}) {
+        SCOPED_TRACE(redirections);
+        gOuterErrors = gOuterWarnings = 0;
+        TestHost host;
+        for (int i = 0; i < redirections; ++i) RedirectCodecMessages(host.ctx());
+        RestoreCodecMessages(host.ctx());
+        TIFFError("mod", "after");
+        TIFFWarning("mod", "after");
+        EXPECT_EQ(gOuterErrors, 1);
+        EXPECT_EQ(gOuterWarnings, 1);
+        EXPECT_TRUE(host.codecErrors.empty());
+    }
 }
 
-TEST_F(CodecMessagesTest, NullErrorSinkDropsErrorsWhileWarningsArrive) {
-    TestHost host;
-    host->errorProc = nullptr;
-    RedirectCodecMessages(host.ctx());
-    TIFFError("mod", "lost");
-    TIFFWarning("mod", "kept");
-    RestoreCodecMessages(host.ctx());
-    EXPECT_TRUE(host.codecErrors.empty());
-    EXPECT_EQ(host.codecWarnings, (std::vector<CodecMessage>{{-400, "mod:kept"}}));
-    EXPECT_EQ(gOuterErrors, 0) << "no handler may be installed for a null sink";
-}
-
-TEST_F(CodecMessagesTest, RestorePutsBackTheHandlersInForceAtRedirection) {
-    TestHost host;
-    RedirectCodecMessages(host.ctx());
-    EXPECT_EQ(host->savedErrorHandler, &OuterError);
-    EXPECT_EQ(host->savedWarningHandler, &OuterWarning);
-    RestoreCodecMessages(host.ctx());
-    TIFFError("mod", "after");
-    TIFFWarning("mod", "after");
-    EXPECT_EQ(gOuterErrors, 1);
-    EXPECT_EQ(gOuterWarnings, 1);
-    EXPECT_TRUE(host.codecErrors.empty());
-}
-
-TEST_F(CodecMessagesTest, RedirectingTwiceKeepsTheFirstSavedHandlers) {
-    TestHost host;
-    RedirectCodecMessages(host.ctx());
-    RedirectCodecMessages(host.ctx());
-    RestoreCodecMessages(host.ctx());
-    TIFFError("mod", "after");
-    EXPECT_EQ(gOuterErrors, 1);
-}
-
-TEST_F(CodecMessagesTest, RestoreWithoutRedirectionLeavesTheCodecAlone) {
-    TestHost host;
-    RestoreCodecMessages(host.ctx());  // a job that never opened anything
-    TIFFError("mod", "still routed");
-    EXPECT_EQ(gOuterErrors, 1);
-}
-
+// A message over 511 characters is announced on the error sink, then
+// delivered cut to 511, never inside a UTF-8 character; an overlong module
+// name is cut too; a null module name gives an empty prefix.
 TEST_F(CodecMessagesTest, LongMessageIsAnnouncedAndCutTo511Characters) {
-    TestHost host;
-    RedirectCodecMessages(host.ctx());
-    const std::string body(600, 'x');
-    TIFFError("module", "%s", body.c_str());
-    RestoreCodecMessages(host.ctx());
-    ASSERT_EQ(host.codecErrors.size(), 2u);
-    EXPECT_EQ(host.codecErrors[0], (CodecMessage{-400, kOverrun}));
-    EXPECT_EQ(host.codecErrors[1].text, "module:" + std::string(511 - 7, 'x'));
+    const std::string longModule(700, 'M');
+    const struct {
+        const char* module;
+        std::string body;
+        std::string delivered;
+        bool announced;
+    } cases[] = {
+        {"module", std::string(600, 'x'), "module:" + std::string(511 - 7, 'x'), true},
+        {"m", std::string(509, 'y'), "m:" + std::string(509, 'y'), false},  // just fits
+        {"m", std::string(510, 'y'), "m:" + std::string(509, 'y'), true},   // one too many
+        {"m", std::string(508, 'a') + "\xC3\xA9\xC3\xA9", "m:" + std::string(508, 'a'), true},
+        {longModule.c_str(), "text", std::string(511, 'M'), true},
+        {nullptr, "no module", ":no module", false},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.delivered.substr(0, 12) + "… of " + std::to_string(c.delivered.size()));
+        TestHost host;
+        RedirectCodecMessages(host.ctx());
+        TIFFErrorExt(nullptr, c.module, "%s", c.body.c_str());
+        RestoreCodecMessages(host.ctx());
+        Messages expected{{-400, c.delivered}};
+        if (c.announced) expected.insert(expected.begin(), {-400, kOverrun});
+        EXPECT_EQ(host.codecErrors, expected);
+    }
 }
 
-TEST_F(CodecMessagesTest, MessageThatJustFitsIsNotAnnounced) {
-    TestHost host;
-    RedirectCodecMessages(host.ctx());
-    TIFFError("m", "%s", std::string(509, 'y').c_str());  // "m:" + 509 = 511 characters
-    TIFFError("m", "%s", std::string(510, 'y').c_str());  // one too many
-    RestoreCodecMessages(host.ctx());
-    ASSERT_EQ(host.codecErrors.size(), 3u);
-    EXPECT_EQ(host.codecErrors[0].text.size(), 511u);
-    EXPECT_EQ(host.codecErrors[1].text, kOverrun);
-    EXPECT_EQ(host.codecErrors[2].text.size(), 511u);
-}
-
-TEST_F(CodecMessagesTest, CutNeverSplitsAUtf8Character) {
-    TestHost host;
-    RedirectCodecMessages(host.ctx());
-    std::string body(508, 'a');
-    body += "\xC3\xA9\xC3\xA9";  // the first é straddles the limit
-    TIFFError("m", "%s", body.c_str());
-    RestoreCodecMessages(host.ctx());
-    ASSERT_EQ(host.codecErrors.size(), 2u);
-    EXPECT_EQ(host.codecErrors[1].text, "m:" + std::string(508, 'a'));
-}
-
-TEST_F(CodecMessagesTest, OverlongModuleNameIsCutToo) {
-    TestHost host;
-    RedirectCodecMessages(host.ctx());
-    TIFFError(std::string(700, 'M').c_str(), "text");
-    RestoreCodecMessages(host.ctx());
-    ASSERT_EQ(host.codecErrors.size(), 2u);
-    EXPECT_EQ(host.codecErrors[1].text, std::string(511, 'M'));
-}
-
+// The overrun notice of a warning goes to the error sink when there is one,
+// otherwise to the warning sink ahead of the cut warning.
 TEST_F(CodecMessagesTest, WarningOverrunNoticeGoesToTheErrorSinkWhenThereIsOne) {
-    TestHost host;
-    RedirectCodecMessages(host.ctx());
-    TIFFWarning("m", "%s", std::string(600, 'w').c_str());
-    RestoreCodecMessages(host.ctx());
-    EXPECT_EQ(host.codecErrors, (std::vector<CodecMessage>{{-400, kOverrun}}));
-    ASSERT_EQ(host.codecWarnings.size(), 1u);
-    EXPECT_EQ(host.codecWarnings[0].text.size(), 511u);
-}
-
-TEST_F(CodecMessagesTest, WarningOverrunNoticeGoesToTheWarningSinkWithoutAnErrorSink) {
-    TestHost host;
-    host.UseExSinks();
-    host->errorProcEx = nullptr;
-    RedirectCodecMessages(host.ctx());
-    TIFFWarning("m", "%s", std::string(600, 'w').c_str());
-    RestoreCodecMessages(host.ctx());
-    EXPECT_TRUE(host.codecErrors.empty());
-    ASSERT_EQ(host.codecWarnings.size(), 2u);
-    EXPECT_EQ(host.codecWarnings[0], (CodecMessage{-400, kOverrun}));
-}
-
-TEST_F(CodecMessagesTest, NullModuleNameGivesAnEmptyPrefix) {
-    TestHost host;
-    RedirectCodecMessages(host.ctx());
-    TIFFErrorExt(nullptr, nullptr, "no module");
-    RestoreCodecMessages(host.ctx());
-    EXPECT_EQ(host.codecErrors, (std::vector<CodecMessage>{{-400, ":no module"}}));
+    const Messages cut{{-400, "m:" + std::string(509, 'w')}};
+    const Messages notice{{-400, kOverrun}};
+    for (bool errorSink : {true, false}) {
+        SCOPED_TRACE(errorSink);
+        TestHost host;
+        if (!errorSink) {
+            host.UseExSinks();
+            host->errorProcEx = nullptr;
+        }
+        RedirectCodecMessages(host.ctx());
+        TIFFWarning("m", "%s", std::string(600, 'w').c_str());
+        RestoreCodecMessages(host.ctx());
+        EXPECT_EQ(host.codecErrors, errorSink ? notice : Messages{});
+        EXPECT_EQ(host.codecWarnings, (errorSink ? cut : Messages{notice[0], cut[0]}));
+    }
 }
 
 }  // namespace

@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <cstring>
+#include <string>
 #include <vector>
 
 #include "frame/io_procs.h"
@@ -14,193 +15,160 @@ using namespace zan;
 using zantest::TestAllocator;
 using zantest::TestHost;
 
+std::string Text(const void* bytes, size_t n) { return std::string(static_cast<const char*>(bytes), n); }
+char* Chars(const char* s) { return const_cast<char*>(s); }
+constexpr uint32_t Back(uint32_t n) { return 0u - n; }  // a backward move as a wrapped offset
+
+// A memory source over the ten bytes "abcdefghij".
 class MemorySourceTest : public ::testing::Test {
 protected:
     void SetUp() override {
-        for (int i = 0; i < 10; ++i) data_[i] = static_cast<unsigned char>('a' + i);
         host_->memBase = host_->memPos = data_;
         host_->memCapacity = host_->memSize = sizeof data_;
     }
-    uint32_t Position() { return MemSeekProc(host_.ctx(), 0, SEEK_CUR); }
-
     TestHost host_;
-    unsigned char data_[10];
+    ConversionContext* c_ = host_.ctx();
+    unsigned char data_[10] = {'a', 'b', 'c', 'd', 'e', 'f', 'g', 'h', 'i', 'j'};
 };
 
-TEST_F(MemorySourceTest, ReadsStopAtTheEndOfTheData) {
+// Reads and the size stop at the end of the data; the image is never mapped.
+TEST_F(MemorySourceTest, ReadsAndSizeStopAtTheEndOfTheData) {
     char out[16] = {};
-    EXPECT_EQ(MemReadProc(host_.ctx(), out, 4), 4);
-    EXPECT_EQ(std::string(out, 4), "abcd");
-    MemSeekProc(host_.ctx(), 7, SEEK_SET);
-    EXPECT_EQ(MemReadProc(host_.ctx(), out, 8), 3) << "a read crossing the end returns what is left";
-    EXPECT_EQ(std::string(out, 3), "hij");
-    EXPECT_EQ(MemReadProc(host_.ctx(), out, 8), 0);
-    EXPECT_EQ(Position(), 10u) << "a read at the end does not move";
-    EXPECT_EQ(MemReadProc(host_.ctx(), out, 0), 0);
-    EXPECT_EQ(MemReadProc(host_.ctx(), out, -5), 0);
+    EXPECT_EQ(MemReadProc(c_, out, 4), 4);
+    EXPECT_EQ(Text(out, 4), "abcd");
+    MemSeekProc(c_, 7, SEEK_SET);
+    EXPECT_EQ(MemReadProc(c_, out, 8), 3) << "a read crossing the end returns what is left";
+    EXPECT_EQ(Text(out, 3), "hij");
+    EXPECT_EQ(MemReadProc(c_, out, 8), 0);
+    EXPECT_EQ(MemSeekProc(c_, 0, SEEK_CUR), 10u) << "a read at the end does not move";
+    EXPECT_EQ(MemReadProc(c_, out, 0), 0);
+    EXPECT_EQ(MemReadProc(c_, out, -5), 0);
+    EXPECT_EQ(MemSizeProc(c_), 10u);
+    void* base = nullptr;
+    uint32_t size = 0;
+    EXPECT_EQ(MemMapProc(c_, &base, &size), 0);
 }
 
 TEST_F(MemorySourceTest, SeeksUse32BitArithmetic) {
-    EXPECT_EQ(MemSeekProc(host_.ctx(), 6, SEEK_SET), 6u);
-    EXPECT_EQ(MemSeekProc(host_.ctx(), static_cast<uint32_t>(-4), SEEK_CUR), 2u)
-        << "a backward move is a wrapped 32-bit offset";
+    EXPECT_EQ(MemSeekProc(c_, 6, SEEK_SET), 6u);
+    EXPECT_EQ(MemSeekProc(c_, Back(4), SEEK_CUR), 2u);
     char c = 0;
-    EXPECT_EQ(MemReadProc(host_.ctx(), &c, 1), 1);
+    EXPECT_EQ(MemReadProc(c_, &c, 1), 1);
     EXPECT_EQ(c, 'c');
-    EXPECT_EQ(MemSeekProc(host_.ctx(), static_cast<uint32_t>(-1), SEEK_END), 9u);
-    EXPECT_EQ(MemSeekProc(host_.ctx(), 100, SEEK_SET), 100u) << "no bound check";
-    EXPECT_EQ(MemReadProc(host_.ctx(), &c, 1), 0);
-    EXPECT_EQ(MemSeekProc(host_.ctx(), 3, 7), 100u) << "unknown whence leaves the position";
+    EXPECT_EQ(MemSeekProc(c_, Back(1), SEEK_END), 9u);
+    EXPECT_EQ(MemSeekProc(c_, 100, SEEK_SET), 100u) << "no bound check";
+    EXPECT_EQ(MemReadProc(c_, &c, 1), 0);
+    EXPECT_EQ(MemSeekProc(c_, 3, 7), 100u) << "unknown whence leaves the position";
 }
 
-TEST_F(MemorySourceTest, SizeAndMapDescribeTheImageWithoutMapping) {
-    EXPECT_EQ(MemSizeProc(host_.ctx()), 10u);
-    void* base = nullptr;
-    uint32_t size = 0;
-    EXPECT_EQ(MemMapProc(host_.ctx(), &base, &size), 0);
-    EXPECT_EQ(base, data_);
-    EXPECT_EQ(size, 10u);
-}
-
+// A growing image in an 8-byte block of stale bytes.
 class GrowingImageTest : public ::testing::Test {
 protected:
     void SetUp() override {
         TestAllocator::Reset();
-        auto* block = static_cast<unsigned char*>(TestAllocator::Alloc(8));
-        std::memset(block, 0xEE, 8);  // stale bytes a careless writer would leak
-        host_->memBase = host_->memPos = block;
+        host_->memBase = host_->memPos = static_cast<unsigned char*>(TestAllocator::Alloc(8));
+        std::memset(host_->memBase, 0xEE, 8);  // stale bytes a careless writer would leak
         host_->memCapacity = 8;
         host_->memSize = 0;
     }
-    void TearDown() override { TestAllocator::Free(host_->memBase); }
-    std::vector<unsigned char> Image() {
-        return std::vector<unsigned char>(host_->memBase, host_->memBase + host_->memSize);
+    void TearDown() override {
+        TestAllocator::Reset();
+        TestAllocator::Free(host_->memBase);
     }
+    std::string Data() { return Text(host_->memBase, host_->memSize); }
     int32_t Write(const std::string& s) {
-        return MemGrowWriteProc(host_.ctx(), const_cast<char*>(s.data()), static_cast<int32_t>(s.size()));
+        return MemGrowWriteProc(c_, Chars(s.c_str()), static_cast<int32_t>(s.size()));
     }
 
     TestHost host_;
+    ConversionContext* c_ = host_.ctx();
 };
 
-TEST_F(GrowingImageTest, GrowsToWhatTheWriteNeedsPlus512) {
-    EXPECT_EQ(Write("12345"), 5);
-    EXPECT_EQ(host_->memCapacity, 8u) << "fits: no growth";
-    EXPECT_EQ(Write("6789"), 4);
-    EXPECT_EQ(host_->memCapacity, 9u + 512u);
-    EXPECT_EQ(host_->memSize, 9u);
-    EXPECT_EQ(MemSeekProc(host_.ctx(), 0, SEEK_CUR), 9u) << "the position keeps its distance";
-    EXPECT_EQ(Image(), std::vector<unsigned char>({'1', '2', '3', '4', '5', '6', '7', '8', '9'}));
-}
-
-TEST_F(GrowingImageTest, BytesSkippedByASeekReadBackAsZero) {
+// Bytes skipped by a seek, inside the block or beyond it, read back as zero;
+// overwriting inside the data keeps its size; after the block grows the
+// position keeps its distance; the image reads back whole.
+TEST_F(GrowingImageTest, WritesLandAtThePositionAndGapsAreZero) {
     Write("ab");
-    MemSeekProc(host_.ctx(), 5, SEEK_SET);  // inside the block, beyond the data
+    MemSeekProc(c_, 5, SEEK_SET);
     Write("c");
-    MemSeekProc(host_.ctx(), 20, SEEK_SET);  // beyond the block
-    Write("d");
-    const std::vector<unsigned char> expected = {'a', 'b', 0, 0, 0, 'c', 0, 0, 0, 0, 0,
-                                                 0,   0,   0, 0, 0,   0, 0, 0, 0, 'd'};
-    EXPECT_EQ(Image(), expected);
+    MemSeekProc(c_, 1, SEEK_SET);
+    Write("X");
+    EXPECT_EQ(Data(), Text("aX\0\0\0c", 6));
+    MemSeekProc(c_, 20, SEEK_SET);
+    EXPECT_EQ(Write("d"), 1);
+    EXPECT_EQ(MemSeekProc(c_, 0, SEEK_CUR), 21u);
+    EXPECT_EQ(Write("e"), 1);
+    EXPECT_EQ(Data(), Text("aX\0\0\0c", 6) + std::string(14, '\0') + "de");
+    char out[22];
+    MemSeekProc(c_, 0, SEEK_SET);
+    EXPECT_EQ(MemReadProc(c_, out, 22), 22);
 }
 
-TEST_F(GrowingImageTest, OverwritingInsideTheDataKeepsItsSize) {
-    Write("abcdef");
-    MemSeekProc(host_.ctx(), 1, SEEK_SET);
-    Write("XY");
-    EXPECT_EQ(host_->memSize, 6u);
-    EXPECT_EQ(Image(), std::vector<unsigned char>({'a', 'X', 'Y', 'd', 'e', 'f'}));
-    char out[6];
-    MemSeekProc(host_.ctx(), 0, SEEK_SET);
-    EXPECT_EQ(MemReadProc(host_.ctx(), out, 6), 6) << "the image reads back what was written";
-}
-
+// A refused growth is a short write of what still fits in the block, with a
+// host error; the data never end past the block, even after a rewind. A
+// size beyond 32 bits is refused without a wrapped request to the host.
 TEST_F(GrowingImageTest, RefusedGrowthIsAShortWriteOfWhatStillFits) {
     Write("abc");
-    TestAllocator::FailNthCall(1);
-    EXPECT_EQ(Write("defghijk"), 5) << "five bytes fit before the old end";
-    EXPECT_EQ(host_.Errors(), std::vector<std::string>{"Memory allocation error"});
-    EXPECT_EQ(host_->memSize, 8u);
-    EXPECT_EQ(host_->memCapacity, 8u);
-}
-
-TEST_F(GrowingImageTest, ShortWriteAfterARewindDoesNotInflateTheSize) {
-    Write("abcdefgh");
-    MemSeekProc(host_.ctx(), 2, SEEK_SET);
     TestAllocator::FailAll();
+    EXPECT_EQ(Write("defghijk"), 5);
+    MemSeekProc(c_, 2, SEEK_SET);
     EXPECT_EQ(Write("0123456789"), 6);
+    EXPECT_EQ(Data(), "ab012345");
     TestAllocator::Reset();
-    EXPECT_EQ(host_->memSize, 8u) << "the data still end at the block's end";
-    EXPECT_EQ(Image(), std::vector<unsigned char>({'a', 'b', '0', '1', '2', '3', '4', '5'}));
-}
-
-TEST_F(GrowingImageTest, CapacityBeyond32BitsIsAnAllocationFailure) {
-    MemSeekProc(host_.ctx(), 0xFFFFFF00u, SEEK_SET);
-    const int calls = TestAllocator::Calls();
+    MemSeekProc(c_, 0xFFFFFF00u, SEEK_SET);
     EXPECT_EQ(Write(std::string(0x100, 'z')), 0);
-    EXPECT_EQ(TestAllocator::Calls(), calls) << "no 32-bit-wrapped request reaches the host";
-    EXPECT_EQ(host_.Errors(), std::vector<std::string>{"Memory allocation error"});
-    EXPECT_EQ(host_->memCapacity, 8u);
+    EXPECT_EQ(TestAllocator::Calls(), 0);
+    EXPECT_EQ(host_.Errors(), std::vector<std::string>(3, "Memory allocation error"));
 }
 
+// The host's fixed buffer of 8 bytes, followed by two guard bytes.
 class FixedBufferTest : public ::testing::Test {
 protected:
     void SetUp() override {
         std::memset(buffer_, '#', sizeof buffer_);
-        host_->destMemory = buffer_;
-        host_->destMemPos = buffer_;
-        host_->destMemoryCapacity = 8;  // two guard bytes follow
+        host_->destMemory = host_->destMemPos = buffer_;
+        host_->destMemoryCapacity = 8;
     }
-    int32_t Write(const std::string& s) {
-        return FixedWriteProc(host_.ctx(), const_cast<char*>(s.data()), static_cast<int32_t>(s.size()));
-    }
+    int32_t Write(const char* s) { return FixedWriteProc(c_, Chars(s), static_cast<int32_t>(std::strlen(s))); }
 
     TestHost host_;
+    ConversionContext* c_ = host_.ctx();
     unsigned char buffer_[10];
 };
 
+// Bytes skipped by a seek are zeroed; writes are cut at the capacity.
 TEST_F(FixedBufferTest, WritesAreCutAtTheCapacityAndNeverOverflow) {
-    EXPECT_EQ(Write("abcdef"), 6);
-    EXPECT_EQ(Write("ghij"), 2);
+    EXPECT_EQ(Write("ab"), 2);
+    FixedSeekProc(c_, 5, SEEK_SET);
+    EXPECT_EQ(Write("cdefg"), 3);
     EXPECT_EQ(Write("k"), 0);
     EXPECT_EQ(host_->memSize, 8u);
-    EXPECT_EQ(std::string(reinterpret_cast<char*>(buffer_), 10), "abcdefgh##");
+    EXPECT_EQ(Text(buffer_, 10), Text("ab\0\0\0cde##", 10));
 }
 
 TEST_F(FixedBufferTest, ReadsNeedTheWholeCountToRemain) {
     Write("abcdef");
-    FixedSeekProc(host_.ctx(), 4, SEEK_SET);
+    FixedSeekProc(c_, 4, SEEK_SET);
     char out[8] = {};
-    EXPECT_EQ(FixedReadProc(host_.ctx(), out, 5), 0) << "more than remains: nothing";
-    EXPECT_EQ(FixedReadProc(host_.ctx(), out, 4), 4);
-    EXPECT_EQ(std::string(out, 2), "ef");
-    EXPECT_EQ(FixedSizeProc(host_.ctx()), 8u);
+    EXPECT_EQ(FixedReadProc(c_, out, 5), 0) << "more than remains: nothing";
+    EXPECT_EQ(FixedReadProc(c_, out, 4), 4);
+    EXPECT_EQ(Text(out, 2), "ef");
 }
 
-TEST_F(FixedBufferTest, SeeksStayInsideTheBuffer) {
-    EXPECT_EQ(FixedSeekProc(host_.ctx(), 8, SEEK_SET), 8u);
-    EXPECT_EQ(FixedSeekProc(host_.ctx(), 9, SEEK_SET), kSeekFailed);
-    EXPECT_EQ(FixedSeekProc(host_.ctx(), 2, SEEK_SET), 2u);
-    EXPECT_EQ(FixedSeekProc(host_.ctx(), 6, SEEK_CUR), 8u);
-    EXPECT_EQ(FixedSeekProc(host_.ctx(), 1, SEEK_CUR), kSeekFailed);
-    EXPECT_EQ(FixedSeekProc(host_.ctx(), 0, 9), 0u);
-}
-
-TEST_F(FixedBufferTest, EndIsTheEndOfTheDataWritten) {
+// Seeks stay inside the capacity. The end is the end of the data written, so
+// appending after a look back does not overwrite what follows.
+TEST_F(FixedBufferTest, SeeksStayInsideTheBufferAndEndAtTheData) {
     Write("abcdef");
-    FixedSeekProc(host_.ctx(), 3, SEEK_SET);
-    EXPECT_EQ(FixedSeekProc(host_.ctx(), 0, SEEK_END), 6u)
-        << "appending after a look back must not overwrite what follows";
-    EXPECT_EQ(FixedSizeProc(host_.ctx()), 6u);
-    EXPECT_EQ(FixedSeekProc(host_.ctx(), static_cast<uint32_t>(-1), SEEK_END), kSeekFailed);
-    EXPECT_EQ(FixedSeekProc(host_.ctx(), 1, SEEK_END), kSeekFailed);
-}
-
-TEST_F(FixedBufferTest, BytesSkippedByASeekAreZeroed) {
-    Write("ab");
-    FixedSeekProc(host_.ctx(), 5, SEEK_SET);
-    Write("c");
-    EXPECT_EQ(std::string(reinterpret_cast<char*>(buffer_), 6), std::string("ab\0\0\0c", 6));
+    EXPECT_EQ(FixedSeekProc(c_, 8, SEEK_SET), 8u);
+    EXPECT_EQ(FixedSeekProc(c_, 9, SEEK_SET), kSeekFailed);
+    EXPECT_EQ(FixedSeekProc(c_, 2, SEEK_SET), 2u);
+    EXPECT_EQ(FixedSeekProc(c_, 6, SEEK_CUR), 8u);
+    EXPECT_EQ(FixedSeekProc(c_, 1, SEEK_CUR), kSeekFailed);
+    EXPECT_EQ(FixedSeekProc(c_, 0, 9), 0u) << "unknown whence";
+    FixedSeekProc(c_, 3, SEEK_SET);
+    EXPECT_EQ(FixedSeekProc(c_, 0, SEEK_END), 6u);
+    EXPECT_EQ(FixedSeekProc(c_, Back(1), SEEK_END), kSeekFailed);
+    EXPECT_EQ(FixedSeekProc(c_, 1, SEEK_END), kSeekFailed);
 }
 
 }  // namespace

@@ -3,9 +3,9 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cstdio>
 #include <functional>
-#include <memory>
 #include <string>
 
 #include "frame/tiff_open.h"
@@ -21,28 +21,29 @@ namespace {
 using namespace zantest;
 using zan::OpenTIFFForReading;
 using zan::OpenTIFFForWriting;
+using Texts = std::vector<std::string>;
 
-// A record of the codec's process-wide handlers, to check they come back.
+// Puts handlers of its own in force as the codec's process-wide ones for its
+// lifetime; InForce() tells whether they are the codec's again.
 struct HandlerProbe {
     static void Error(const char*, const char*, va_list) {}
     static void Warning(const char*, const char*, va_list) {}
-    HandlerProbe() {
-        savedError = TIFFSetErrorHandler(Error);
-        savedWarning = TIFFSetWarningHandler(Warning);
-    }
+    TIFFErrorHandler savedError = TIFFSetErrorHandler(Error);
+    TIFFErrorHandler savedWarning = TIFFSetWarningHandler(Warning);
     ~HandlerProbe() {
         TIFFSetErrorHandler(savedError);
         TIFFSetWarningHandler(savedWarning);
     }
-    // True when the probe's handlers are the codec's again.
-    static bool InForce() {
-        const TIFFErrorHandler e = TIFFSetErrorHandler(Error);
-        const TIFFErrorHandler w = TIFFSetWarningHandler(Warning);
-        return e == Error && w == Warning;
+    static bool InForce() {  // and leaves the handlers in force as they are
+        const TIFFErrorHandler error = TIFFSetErrorHandler(nullptr);
+        const TIFFErrorHandler warning = TIFFSetWarningHandler(nullptr);
+        TIFFSetErrorHandler(error);
+        TIFFSetWarningHandler(warning);
+        return error == Error && warning == Warning;
     }
-    TIFFErrorHandler savedError, savedWarning;
 };
 
+// Three pages: grey, wider grey, LZW-compressed RGB.
 FileSpec ThreePages() {
     FileSpec spec;
     spec.pages.assign(3, PageSpec{});
@@ -72,27 +73,26 @@ std::vector<DecodedPage> DecodeAll(TIFF* tif) {
 }
 
 bool SamePages(const std::vector<DecodedPage>& a, const std::vector<DecodedPage>& b) {
-    if (a.size() != b.size()) return false;
-    for (size_t i = 0; i < a.size(); ++i)
-        if (a[i].width != b[i].width || a[i].height != b[i].height || a[i].pixels != b[i].pixels)
-            return false;
-    return true;
+    return std::equal(a.begin(), a.end(), b.begin(), b.end(), [](const auto& x, const auto& y) {
+        return x.width == y.width && x.height == y.height && x.pixels == y.pixels;
+    });
 }
 
-// ---------------------------------------------------------------- reading
-
 enum class SourceKind { File, Memory, Callbacks, StreamBuffer };
+constexpr SourceKind kSources[] = {SourceKind::File, SourceKind::Memory, SourceKind::Callbacks,
+                                   SourceKind::StreamBuffer};
+const char* const kSourceNames[] = {"File", "Memory", "Callbacks", "StreamBuffer"};
 
-// Binds a TestHost's source to `bytes` in the chosen way and keeps what the
-// source needs alive.
+// Binds a TestHost's source to `bytes` in the chosen way, keeps what the
+// source needs alive, and ends the job before letting go of it.
 class SourceFixture {
 public:
-    SourceFixture(TestHost& host, SourceKind kind, const Bytes& bytes) : bytes_(bytes) {
+    SourceFixture(TestHost& host, SourceKind kind, const Bytes& bytes) : host_(host), bytes_(bytes) {
         ConversionContext* ctx = host.ctx();
         switch (kind) {
         case SourceKind::File: {
             // The TIFF sits after 5 bytes of something else in the file.
-            Bytes padded(bytes.size() + 5, '!');
+            Bytes padded(5 + bytes.size(), '!');
             std::copy(bytes.begin(), bytes.end(), padded.begin() + 5);
             WriteFileBytes(file_.path(), padded);
             fp_ = std::fopen(file_.c_str(), "rb");
@@ -114,174 +114,33 @@ public:
         }
     }
     ~SourceFixture() {
+        host_.EndJob();
         if (fp_) std::fclose(fp_);
     }
     FILE* fp() const { return fp_; }
     MemoryStream& stream() { return stream_; }
 
 private:
+    TestHost& host_;
     Bytes bytes_;
     TempFile file_;
     FILE* fp_ = nullptr;
     MemoryStream stream_;
 };
 
-class ReadingTest : public ::testing::TestWithParam<SourceKind> {};
-
-TEST_P(ReadingTest, ReadsEveryPageOfEverySourceKind) {
-    HandlerProbe probe;
-    const Bytes tiff = MakeTiff(ThreePages());
-    {
-        TestHost host;
-        SourceFixture source(host, GetParam(), tiff);
-        ASSERT_EQ(OpenTIFFForReading(host.ctx()), 1) << ::testing::PrintToString(host.Errors());
-        ASSERT_NE(host->tiff, nullptr);
-        EXPECT_EQ(TIFFGetContextPivlo(host->tiff), host.ctx());
-        EXPECT_FALSE(HandlerProbe::InForce()) << "the job's handlers are in force while open";
-        EXPECT_TRUE(SamePages(DecodeAll(host->tiff), DecodeWithLibtiff(tiff)));
-        EXPECT_TRUE(host.Errors().empty());
-        host.EndJob();
-        EXPECT_EQ(host->tiff, nullptr);
-        EXPECT_EQ(host->fileHandle, nullptr);
-        EXPECT_EQ(host->streamBuffer, nullptr);
-        if (source.fp()) {
-            EXPECT_EQ(std::fseek(source.fp(), 0, SEEK_SET), 0) << "the file stays open";
-        }
-    }
-    EXPECT_TRUE(HandlerProbe::InForce());
-    EXPECT_EQ(TestAllocator::LiveBlocks(), 0u);
-}
-
-std::string SourceName(const ::testing::TestParamInfo<SourceKind>& info) {
-    static const char* const kNames[] = {"File", "Memory", "Callbacks", "StreamBuffer"};
-    return kNames[static_cast<int>(info.param)];
-}
-
-INSTANTIATE_TEST_SUITE_P(Sources, ReadingTest,
-                         ::testing::Values(SourceKind::File, SourceKind::Memory,
-                                           SourceKind::Callbacks, SourceKind::StreamBuffer),
-                         SourceName);
-
-TEST(ReadingOpen, SecondOpenTouchesNeitherSourceNorHandlers) {
-    TestHost host;
-    SourceFixture source(host, SourceKind::Callbacks, MakePages(1));
-    ASSERT_EQ(OpenTIFFForReading(host.ctx()), 1);
-    TIFF* first = host->tiff;
-    const int reads = source.stream().reads;
-    const auto saved = host->savedErrorHandler;
-    host->sourceKind = 99;
-    EXPECT_EQ(OpenTIFFForReading(host.ctx()), 1);
-    EXPECT_EQ(host->tiff, first);
-    EXPECT_EQ(source.stream().reads, reads);
-    EXPECT_EQ(host->savedErrorHandler, saved);
-}
-
-TEST(ReadingOpen, DescribedPageCountsAsOpen) {
-    TestHost host;
-    host->state = ZAN_STATE_DESCRIBED;
-    host->sourceKind = 99;
-    EXPECT_EQ(OpenTIFFForReading(host.ctx()), 1);
-    EXPECT_EQ(host->tiff, nullptr);
-}
-
-TEST(ReadingOpen, UnknownSourceKindFailsWithoutAMessage) {
-    HandlerProbe probe;
-    TestHost host;
-    for (uint32_t kind : {0u, 3u, 5u}) {
-        host->sourceKind = kind;
-        EXPECT_EQ(OpenTIFFForReading(host.ctx()), 0);
-    }
-    EXPECT_TRUE(host.messages.empty());
-    EXPECT_TRUE(HandlerProbe::InForce());
-}
-
-TEST(ReadingOpen, SourceThatIsNoTiffIsRefusedAndNothingIsHeld) {
-    HandlerProbe probe;
-    for (SourceKind kind : {SourceKind::File, SourceKind::Memory, SourceKind::Callbacks,
-                            SourceKind::StreamBuffer}) {
-        TestHost host;
-        SourceFixture source(host, kind, Bytes{'n', 'o', 't', ' ', 'a', ' ', 't', 'i', 'f', 'f'});
-        EXPECT_EQ(OpenTIFFForReading(host.ctx()), 0);
-        EXPECT_EQ(host.Errors(), std::vector<std::string>{"Unable to create a tiff object"});
-        EXPECT_FALSE(host.codecErrors.empty()) << "the codec says why";
-        EXPECT_EQ(host->fileHandle, nullptr);
-        EXPECT_EQ(host->streamBuffer, nullptr);
-        EXPECT_TRUE(HandlerProbe::InForce());
-        EXPECT_EQ(TestAllocator::LiveBlocks(), 0u);
-    }
-}
-
-TEST(ReadingOpen, FileWithoutRecordMemoryReportsMemoryAllocation) {
-    HandlerProbe probe;
-    TestHost host;
-    SourceFixture source(host, SourceKind::File, MakePages(1));
-    TestAllocator::FailNthCall(1);
-    EXPECT_EQ(OpenTIFFForReading(host.ctx()), 0);
-    EXPECT_EQ(host.Errors(), std::vector<std::string>{"Memory allocation"});
-    EXPECT_TRUE(HandlerProbe::InForce());
-}
-
-TEST(ReadingOpen, StreamBufferThatCannotStartReportsInitializing) {
-    TestHost host;
-    SourceFixture source(host, SourceKind::StreamBuffer, MakePages(1));
-    TestAllocator::FailNthCall(1);
-    EXPECT_EQ(OpenTIFFForReading(host.ctx()), 0);
-    EXPECT_EQ(host.Errors(), std::vector<std::string>{"Initializing stream buffer"});
-    EXPECT_EQ(host->streamBuffer, nullptr);
-    ASSERT_FALSE(host.codecErrors.empty()) << "the service reports to the job's error sink";
-    EXPECT_EQ(host.codecErrors[0].code, PIVLO_STREAM_MESSAGE_CODE);
-}
-
-TEST(ReadingOpen, StreamBufferUsesTheSecondMessageStyleWhenChosen) {
-    TestHost host;
-    host.UseExSinks();
-    host->errorProc = nullptr;
-    SourceFixture source(host, SourceKind::StreamBuffer, MakePages(1));
-    TestAllocator::FailNthCall(1);
-    EXPECT_EQ(OpenTIFFForReading(host.ctx()), 0);
-    ASSERT_EQ(host.codecErrors.size(), 1u);
-    EXPECT_EQ(host.codecErrors[0].code, PIVLO_STREAM_MESSAGE_CODE);
-}
-
-TEST(ReadingOpen, MemorySourceWithoutDataIsRefusedCleanly) {
-    TestHost host;
-    host->sourceKind = ZAN_SOURCE_MEMORY;
-    host->sourceMemory = nullptr;
-    host->sourceMemorySize = 4096;
-    EXPECT_EQ(OpenTIFFForReading(host.ctx()), 0);
-    EXPECT_TRUE(host.HasError("Unable to create a tiff object"));
-}
-
-TEST(ReadingOpen, StreamSourceWhoseReadsFailIsRefused) {
-    for (SourceKind kind : {SourceKind::Callbacks, SourceKind::StreamBuffer}) {
-        TestHost host;
-        SourceFixture source(host, kind, MakePages(1));
-        source.stream().failReads = true;
-        EXPECT_EQ(OpenTIFFForReading(host.ctx()), 0);
-        EXPECT_TRUE(host.HasError("Unable to create a tiff object"));
-    }
-}
-
-TEST(ReadingOpen, StreamBufferReadsTheSourceOnlyOnce) {
-    TestHost host;
-    const Bytes tiff = MakeTiff(ThreePages());
-    SourceFixture source(host, SourceKind::StreamBuffer, tiff);
-    source.stream().maxChunk = 7;  // a trickling source
-    ASSERT_EQ(OpenTIFFForReading(host.ctx()), 1);
-    EXPECT_TRUE(SamePages(DecodeAll(host->tiff), DecodeWithLibtiff(tiff)));
-    EXPECT_LE(source.stream().bytesRead, tiff.size());
-}
-
-// ---------------------------------------------------------------- writing
-
 enum class DestKind { FileReopened, FileAsIs, Callbacks, FixedBuffer, GrowingMemory };
+constexpr DestKind kDests[] = {DestKind::FileReopened, DestKind::FileAsIs, DestKind::Callbacks,
+                               DestKind::FixedBuffer, DestKind::GrowingMemory};
+const char* const kDestNames[] = {"FileReopened", "FileAsIs", "Callbacks", "FixedBuffer",
+                                  "GrowingMemory"};
 
 // A destination of the chosen kind for a TestHost, and the bytes it holds
-// once the job has ended.
+// once the job has ended (which its destructor makes sure of). A fixed
+// buffer is followed by guard bytes.
 class DestinationFixture {
 public:
     DestinationFixture(TestHost& host, DestKind kind, uint32_t fixedCapacity = 1 << 20)
-        : host_(host), kind_(kind), fixed_(fixedCapacity + kGuard, 0xAB) {
+        : host_(host), kind_(kind), fixed_(fixedCapacity + kGuard, kGuardByte) {
         ConversionContext* ctx = host.ctx();
         switch (kind) {
         case DestKind::FileReopened:
@@ -289,13 +148,9 @@ public:
             WriteFileBytes(file_.path(), {});
             ctx->destKind = ZAN_DEST_FILE;
             ctx->destPath = file_.c_str();
-            if (kind == DestKind::FileAsIs) {
-                ctx->destFp = std::fopen(file_.c_str(), "w+b");
-                ctx->destFileFlags = ZAN_DEST_FILE_USE_AS_IS;
-            } else {
-                // Read-only on purpose: writing works only through the reopened stream.
-                ctx->destFp = std::fopen(file_.c_str(), "rb");
-            }
+            // Read-only when reopened: writing works only through the module's own stream.
+            ctx->destFp = std::fopen(file_.c_str(), kind == DestKind::FileAsIs ? "w+b" : "rb");
+            if (kind == DestKind::FileAsIs) ctx->destFileFlags = ZAN_DEST_FILE_USE_AS_IS;
             break;
         case DestKind::Callbacks:
             ctx->destKind = ZAN_DEST_CALLBACKS;
@@ -319,6 +174,7 @@ public:
         }
     }
     ~DestinationFixture() {
+        host_.EndJob();
         if (host_->destFp) std::fclose(host_->destFp);
         host_->destFp = nullptr;
         if (block_ != kUnset) TestAllocator::Free(block_);  // the handed-over image
@@ -336,25 +192,25 @@ public:
         case DestKind::FixedBuffer:
             return Bytes(fixed_.begin(), fixed_.begin() + size_);
         case DestKind::GrowingMemory:
-            return block_ && block_ != kUnset ? Bytes(static_cast<uint8_t*>(block_), static_cast<uint8_t*>(block_) + size_)
-                          : Bytes();
+            if (!block_ || block_ == kUnset) return {};
+            return Bytes(static_cast<uint8_t*>(block_), static_cast<uint8_t*>(block_) + size_);
         }
         return {};
     }
     bool GuardIntact() const {
-        for (size_t i = fixed_.size() - kGuard; i < fixed_.size(); ++i)
-            if (fixed_[i] != 0xAB) return false;
-        return true;
+        return std::all_of(fixed_.end() - kGuard, fixed_.end(), [](uint8_t b) { return b == kGuardByte; });
     }
     MemoryStream& stream() { return stream_; }
     void* block() const { return block_; }
+    void Forget() { block_ = nullptr; }
     uint32_t size() const { return size_; }
     const TempFile& file() const { return file_; }
 
 private:
     static constexpr size_t kGuard = 16;
-    inline static char kGuardByte = 0;
-    inline static void* const kUnset = &kGuardByte;  // the open must overwrite it
+    static constexpr uint8_t kGuardByte = 0xAB;
+    inline static char unsetMark_ = 0;
+    inline static void* const kUnset = &unsetMark_;  // the open must overwrite it
     TestHost& host_;
     DestKind kind_;
     TempFile file_;
@@ -364,49 +220,108 @@ private:
     uint32_t size_ = 0xDEAD;
 };
 
-FileSpec TwoPages() {
-    FileSpec spec;
-    spec.pages.assign(2, PageSpec{});
-    spec.pages[1].height = 20;
-    spec.pages[1].compression = COMPRESSION_PACKBITS;
-    return spec;
+// An open object (or a page already described) counts as open: the same
+// object comes back, whatever the kind now says, without touching the source
+// or saving the handlers anew (the codec's come back at teardown).
+TEST(OpenTIFF, OpenJobIsNotOpenedAgain) {
+    HandlerProbe probe;
+    TestHost reader;
+    SourceFixture source(reader, SourceKind::Callbacks, MakePages(1));
+    ASSERT_EQ(OpenTIFFForReading(reader.ctx()), 1);
+    TIFF* const read = reader->tiff;
+    const int reads = source.stream().reads;
+    reader->sourceKind = 99;
+    EXPECT_EQ(OpenTIFFForReading(reader.ctx()), 1);
+    EXPECT_EQ(reader->tiff, read);
+    EXPECT_EQ(source.stream().reads, reads);
+    reader.EndJob();
+    EXPECT_TRUE(HandlerProbe::InForce());
+
+    TestHost described;
+    described->state = ZAN_STATE_DESCRIBED;
+    described->sourceKind = 99;
+    EXPECT_EQ(OpenTIFFForReading(described.ctx()), 1);
+    EXPECT_EQ(described->tiff, nullptr);
+
+    TestHost writer;
+    DestinationFixture dest(writer, DestKind::GrowingMemory);
+    ASSERT_EQ(OpenTIFFForWriting(writer.ctx()), 1);
+    TIFF* const written = writer->tiff;
+    writer->destKind = 42;
+    EXPECT_EQ(OpenTIFFForWriting(writer.ctx()), 1);
+    EXPECT_EQ(writer->tiff, written);
+    writer->destKind = ZAN_DEST_MEMORY;
 }
 
-class WritingTest : public ::testing::TestWithParam<DestKind> {};
-
-TEST_P(WritingTest, EveryDestinationHoldsTheSameMultiPageFile) {
-    static Bytes reference;  // the first kind's bytes; every other kind must match
+// A job left with nothing open can also be torn down twice.
+TEST(OpenTIFF, UnknownSourceOrDestinationKindFailsWithoutAMessage) {
     HandlerProbe probe;
     TestHost host;
-    DestinationFixture dest(host, GetParam());
-    ASSERT_EQ(OpenTIFFForWriting(host.ctx()), 1) << ::testing::PrintToString(host.Errors());
-    EXPECT_EQ(TIFFGetContextPivlo(host->tiff), host.ctx());
-    ASSERT_TRUE(WritePages(host->tiff, TwoPages()));
-    host.EndJob();
+    for (uint32_t kind : {0u, 3u, 5u}) {
+        host->sourceKind = kind;
+        EXPECT_EQ(OpenTIFFForReading(host.ctx()), 0);
+    }
+    for (uint32_t kind : {0u, 5u, 17u}) {
+        host->destKind = kind;
+        EXPECT_EQ(OpenTIFFForWriting(host.ctx()), 0);
+    }
+    zanDestroyTIFF(host.ctx());
+    zanDestroyTIFF(host.ctx());
+    zanDestroyTIFF(nullptr);
+    EXPECT_TRUE(host.messages.empty());
     EXPECT_TRUE(HandlerProbe::InForce());
-    EXPECT_TRUE(host.Errors().empty()) << ::testing::PrintToString(host.Errors());
-    const Bytes written = dest.Written();
-    EXPECT_TRUE(SamePages(DecodeWithLibtiff(written), DecodeWithLibtiff(MakeTiff(TwoPages()))));
-    if (reference.empty()) reference = written;
-    EXPECT_EQ(written, reference);
-    EXPECT_EQ(TestAllocator::LiveBlocks(), GetParam() == DestKind::GrowingMemory ? 1u : 0u)
-        << "only the handed-over image is left, and it is the host's";
 }
 
-std::string DestName(const ::testing::TestParamInfo<DestKind>& info) {
-    static const char* const kNames[] = {"FileReopened", "FileAsIs", "Callbacks", "FixedBuffer",
-                                         "GrowingMemory"};
-    return kNames[static_cast<int>(info.param)];
+// Whatever keeps a source from being opened, the host gets one error saying
+// what failed, the codec's handlers are back and nothing is held. The codec
+// says why it refused the bytes; the stream buffer service says why it could
+// not start, in the message style the job chose.
+TEST(ReadingOpen, SourceThatCannotBeOpenedIsRefusedAndNothingIsHeld) {
+    enum Fault { NotATiff, ReadsFail, NoData, NoMemory, NoMemorySecondStyle };
+    const std::pair<SourceKind, Fault> cases[] = {
+        {SourceKind::File, NotATiff},       {SourceKind::Memory, NotATiff},
+        {SourceKind::Callbacks, NotATiff},  {SourceKind::StreamBuffer, NotATiff},
+        {SourceKind::Callbacks, ReadsFail}, {SourceKind::StreamBuffer, ReadsFail},
+        {SourceKind::Memory, NoData},       {SourceKind::File, NoMemory},
+        {SourceKind::StreamBuffer, NoMemory}, {SourceKind::StreamBuffer, NoMemorySecondStyle}};
+    for (const auto& [kind, fault] : cases) {
+        SCOPED_TRACE(std::string(kSourceNames[static_cast<int>(kind)]) + " fault " + std::to_string(fault));
+        const bool noMemory = fault == NoMemory || fault == NoMemorySecondStyle;
+        HandlerProbe probe;
+        TestHost host;
+        if (fault == NoMemorySecondStyle) {
+            host.UseExSinks();
+            host->errorProc = nullptr;
+        }
+        SourceFixture source(host, kind, fault == NotATiff ? Bytes{'n', 'o', 't', ' ', 't', 'i', 'f', 'f'}
+                                                           : MakePages(1));
+        source.stream().failReads = fault == ReadsFail;
+        if (fault == NoData) {
+            host->sourceMemory = nullptr;
+            host->sourceMemorySize = 4096;
+        }
+        if (noMemory) TestAllocator::FailNthCall(1);
+        EXPECT_EQ(OpenTIFFForReading(host.ctx()), 0);
+        const char* error = !noMemory                   ? "Unable to create a tiff object"
+                            : kind == SourceKind::File ? "Memory allocation"
+                                                        : "Initializing stream buffer";
+        EXPECT_EQ(host.Errors(), Texts{error});
+        if (!noMemory) {
+            EXPECT_FALSE(host.codecErrors.empty()) << "the codec says why";
+        } else if (kind == SourceKind::StreamBuffer) {
+            ASSERT_EQ(host.codecErrors.size(), 1u);
+            EXPECT_EQ(host.codecErrors[0].code, PIVLO_STREAM_MESSAGE_CODE);
+        }
+        EXPECT_TRUE(HandlerProbe::InForce());
+        EXPECT_EQ(TestAllocator::LiveBlocks(), 0u);
+    }
 }
 
-INSTANTIATE_TEST_SUITE_P(Destinations, WritingTest,
-                         ::testing::Values(DestKind::FileReopened, DestKind::FileAsIs,
-                                           DestKind::Callbacks, DestKind::FixedBuffer,
-                                           DestKind::GrowingMemory),
-                         DestName);
+// ---------------------------------------------------------------- writing
 
 TEST(WritingOpen, AppendModeAddsPagesToAnExistingFile) {
     for (DestKind kind : {DestKind::FileReopened, DestKind::Callbacks}) {
+        SCOPED_TRACE(kDestNames[static_cast<int>(kind)]);
         TestHost host;
         DestinationFixture dest(host, kind);
         const Bytes first = MakePages(1);
@@ -430,190 +345,90 @@ TEST(WritingOpen, CallbackDestinationWithoutReadBackFailsAtTheSecondPage) {
     DestinationFixture dest(host, DestKind::Callbacks);
     host->sourceReadProc = nullptr;
     ASSERT_EQ(OpenTIFFForWriting(host.ctx()), 1);
-    FileSpec one;
-    EXPECT_TRUE(WritePages(host->tiff, one, 0));
-    EXPECT_FALSE(WritePages(host->tiff, one, 1));
+    EXPECT_TRUE(WritePages(host->tiff, FileSpec{}, 0));
+    EXPECT_FALSE(WritePages(host->tiff, FileSpec{}, 1));
     EXPECT_TRUE(host.HasError(
         "Destination cannot be read back: a source read function is needed to add a page"));
     host.EndJob();
-    const auto pages = DecodeWithLibtiff(dest.Written());
-    EXPECT_GE(pages.size(), 1u) << "the first page stays readable";
+    EXPECT_GE(DecodeWithLibtiff(dest.Written()).size(), 1u) << "the first page stays readable";
 }
 
-TEST(WritingOpen, FileIsReopenedFromItsPathUnlessUsedAsIs) {
-    TestHost host;
-    DestinationFixture dest(host, DestKind::FileReopened);
-    FILE* handedIn = host->destFp;
-    ASSERT_EQ(OpenTIFFForWriting(host.ctx()), 1);
-    EXPECT_NE(host->destFp, nullptr);
-    (void)handedIn;  // closed by the open; only the new stream may be used
-    ASSERT_TRUE(WritePages(host->tiff, FileSpec{}));
-    host.EndJob();
-    EXPECT_EQ(DecodeWithLibtiff(dest.Written()).size(), 1u);
-}
-
-TEST(WritingOpen, FileThatCannotBeReopenedLeavesNoStream) {
-    HandlerProbe probe;
-    TestHost host;
-    host->destKind = ZAN_DEST_FILE;
-    host->destPath = "/nonexistent-dir/zantiff/out.tif";
-    host->destFp = nullptr;
-    EXPECT_EQ(OpenTIFFForWriting(host.ctx()), 0);
-    EXPECT_EQ(host.Errors(), std::vector<std::string>{"Unable to reopen destination file."});
-    EXPECT_EQ(host->destFp, nullptr);
-    EXPECT_TRUE(HandlerProbe::InForce());
-}
-
-TEST(WritingOpen, FileRecordThatCannotBeHadReportsMemoryAllocation) {
-    TestHost host;
-    DestinationFixture dest(host, DestKind::FileAsIs);
-    TestAllocator::FailNthCall(1);
-    EXPECT_EQ(OpenTIFFForWriting(host.ctx()), 0);
-    EXPECT_EQ(host.Errors(), std::vector<std::string>{"Memory allocation"});
-    EXPECT_EQ(host->fileHandle, nullptr);
-}
-
-TEST(WritingOpen, CallbackDestinationNeedsASeekFunction) {
-    HandlerProbe probe;
-    TestHost host;
-    DestinationFixture dest(host, DestKind::Callbacks);
-    host->destSeekProc = nullptr;
-    EXPECT_EQ(OpenTIFFForWriting(host.ctx()), 0);
-    EXPECT_EQ(host.Errors(), std::vector<std::string>{
-                                 "Destination function is supported only when seek function is provided"});
-    EXPECT_TRUE(HandlerProbe::InForce());
-}
-
-TEST(WritingOpen, UnknownDestinationKindFailsWithoutAMessage) {
-    HandlerProbe probe;
-    TestHost host;
-    for (uint32_t kind : {0u, 5u, 17u}) {
-        host->destKind = kind;
-        EXPECT_EQ(OpenTIFFForWriting(host.ctx()), 0);
-    }
-    EXPECT_TRUE(host.messages.empty());
-    EXPECT_TRUE(HandlerProbe::InForce());
-}
-
-TEST(WritingOpen, SecondOpenReturnsTheSameObject) {
-    TestHost host;
-    DestinationFixture dest(host, DestKind::GrowingMemory);
-    ASSERT_EQ(OpenTIFFForWriting(host.ctx()), 1);
-    TIFF* first = host->tiff;
-    host->destKind = 42;
-    EXPECT_EQ(OpenTIFFForWriting(host.ctx()), 1);
-    EXPECT_EQ(host->tiff, first);
-    host->destKind = ZAN_DEST_MEMORY;
-}
-
-TEST(GrowingMemory, FirstBlockIsHalfTheFrameBufferPlus60) {
-    for (uint32_t frame : {0u, 1u, 1000u}) {
+// Each refused destination fails the open with its own host error, the
+// codec's handlers back in force and nothing held: a growing image whose
+// codec object cannot be created releases its block and the work buffer.
+TEST(WritingOpen, DestinationThatCannotBeOpenedIsRefusedWithItsReason) {
+    struct Case {
+        DestKind kind;
+        const char* error;
+        std::function<void(TestHost&)> spoil;
+    };
+    const Case cases[] = {
+        {DestKind::FileReopened, "Unable to reopen destination file.",
+         [](TestHost& host) {
+             std::fclose(host->destFp);
+             host->destFp = nullptr;
+             host->destPath = "/nonexistent-dir/zantiff/out.tif";
+         }},
+        {DestKind::Callbacks, "Destination function is supported only when seek function is provided",
+         [](TestHost& host) { host->destSeekProc = nullptr; }},
+        {DestKind::FileAsIs, "Memory allocation", [](TestHost&) { TestAllocator::FailNthCall(1); }},
+        {DestKind::GrowingMemory, "Memory allocation", [](TestHost&) { TestAllocator::FailNthCall(1); }},
+        {DestKind::GrowingMemory, "Unable to create TIFF object",
+         [](TestHost& host) {
+             pivloWorkBuffer(host.ctx(), 100);
+             TestAllocator::FailNthCall(2);  // the block is had, the codec's own record is not
+         }},
+    };
+    for (const Case& c : cases) {
+        SCOPED_TRACE(kDestNames[static_cast<int>(c.kind)]);
+        HandlerProbe probe;
         TestHost host;
-        DestinationFixture dest(host, DestKind::GrowingMemory);
-        host->frameBufferSize = frame;
-        ASSERT_EQ(OpenTIFFForWriting(host.ctx()), 1);
-        EXPECT_EQ(host->memCapacity, frame / 2 + 60);
-        EXPECT_EQ(dest.block(), nullptr) << "the host's variable is cleared at the open";
-        EXPECT_EQ(dest.size(), 0u);
+        DestinationFixture dest(host, c.kind);
+        c.spoil(host);
+        EXPECT_EQ(OpenTIFFForWriting(host.ctx()), 0);
+        EXPECT_EQ(host.Errors(), Texts{c.error});
+        EXPECT_EQ(TestAllocator::LiveBlocks(), 0u);
+        if (c.kind == DestKind::FileReopened) { EXPECT_EQ(host->destFp, nullptr); }
+        EXPECT_TRUE(HandlerProbe::InForce());
     }
 }
 
-TEST(GrowingMemory, ImageGrowsAndIsHandedOverShrunk) {
+// With no page written the image is the 8-byte header the codec wrote at the
+// open; a second teardown hands nothing over again.
+TEST(GrowingMemory, EmptyImageIsHandedOverOnceAsTheHeaderAlone) {
     TestHost host;
     DestinationFixture dest(host, DestKind::GrowingMemory);
     ASSERT_EQ(OpenTIFFForWriting(host.ctx()), 1);
-    ASSERT_TRUE(WritePages(host->tiff, TwoPages()));
-    const uint32_t written = host->memSize;
-    EXPECT_GT(host->memCapacity, 60u);
-    host.EndJob();
-    EXPECT_EQ(dest.size(), written);
-    ASSERT_NE(dest.block(), nullptr);
-    EXPECT_TRUE(TestAllocator::Owns(dest.block())) << "the block comes from the job's allocator";
-    EXPECT_EQ(host->memBase, nullptr) << "the module no longer holds the image";
-    EXPECT_EQ(DecodeWithLibtiff(dest.Written()).size(), 2u);
-}
-
-TEST(GrowingMemory, NoPageWrittenHandsOverTheHeaderAlone) {
-    TestHost host;
-    DestinationFixture dest(host, DestKind::GrowingMemory);
-    ASSERT_EQ(OpenTIFFForWriting(host.ctx()), 1);
-    host.EndJob();
-    EXPECT_EQ(dest.size(), 8u) << "the codec writes the 8-byte header when it opens";
+    zanDestroyTIFF(host.ctx());
+    EXPECT_EQ(dest.size(), 8u);
     ASSERT_NE(dest.block(), nullptr);
     EXPECT_EQ(dest.Written()[0], dest.Written()[1]) << "II or MM";
-}
-
-TEST(GrowingMemory, SecondTeardownHandsNothingOverAgain) {
-    TestHost host;
-    DestinationFixture dest(host, DestKind::GrowingMemory);
-    ASSERT_EQ(OpenTIFFForWriting(host.ctx()), 1);
-    ASSERT_TRUE(WritePages(host->tiff, FileSpec{}));
-    zanDestroyTIFF(host.ctx());
-    void* handed = dest.block();
-    *static_cast<void**>(host->destMemory) = nullptr;
+    void* const handed = dest.block();
+    dest.Forget();
     zanDestroyTIFF(host.ctx());
     EXPECT_EQ(dest.block(), nullptr);
     TestAllocator::Free(handed);
 }
 
-TEST(GrowingMemory, CodecThatCannotBeCreatedReleasesTheBlock) {
-    HandlerProbe probe;
-    TestHost host;
-    DestinationFixture dest(host, DestKind::GrowingMemory);
-    pivloWorkBuffer(host.ctx(), 100);
-    TestAllocator::FailNthCall(2);  // the block is had, the codec's own record is not
-    EXPECT_EQ(OpenTIFFForWriting(host.ctx()), 0);
-    EXPECT_TRUE(host.HasError("Unable to create TIFF object"));
-    EXPECT_EQ(host->memBase, nullptr);
-    EXPECT_EQ(TestAllocator::LiveBlocks(), 0u) << "block released and work buffer reset";
-    EXPECT_TRUE(HandlerProbe::InForce());
-}
-
-TEST(GrowingMemory, FirstBlockThatCannotBeHadReportsMemoryAllocation) {
-    TestHost host;
-    DestinationFixture dest(host, DestKind::GrowingMemory);
-    TestAllocator::FailNthCall(1);
-    EXPECT_EQ(OpenTIFFForWriting(host.ctx()), 0);
-    EXPECT_EQ(host.Errors(), std::vector<std::string>{"Memory allocation"});
-}
-
-TEST(FixedBuffer, PageThatDoesNotFitFailsWithoutOverflow) {
-    TestHost host;
-    DestinationFixture dest(host, DestKind::FixedBuffer, 200);
-    if (OpenTIFFForWriting(host.ctx()) == 1) {
-        FileSpec big;
-        big.pages[0].width = 64;
-        big.pages[0].height = 64;
-        EXPECT_FALSE(WritePages(host->tiff, big));
+// A page too big for the buffer, or a buffer too small for the header: the
+// open or the write fails with a report, and nothing lands past the capacity.
+TEST(FixedBuffer, WritingPastTheCapacityFailsWithoutOverflow) {
+    FileSpec big;
+    big.pages[0].width = big.pages[0].height = 64;
+    for (const auto& [capacity, spec] : {std::pair{200u, big}, std::pair{4u, FileSpec{}}}) {
+        SCOPED_TRACE(capacity);
+        TestHost host;
+        DestinationFixture dest(host, DestKind::FixedBuffer, capacity);
+        if (OpenTIFFForWriting(host.ctx()) == 1) {
+            EXPECT_FALSE(WritePages(host->tiff, spec));
+        } else {
+            EXPECT_TRUE(host.HasError("Unable to create TIFF object"));
+        }
+        host.EndJob();
+        EXPECT_FALSE(host.codecErrors.empty()) << "the codec reports the failed write";
+        EXPECT_TRUE(dest.GuardIntact());
+        EXPECT_LE(dest.size(), capacity);
     }
-    host.EndJob();
-    EXPECT_FALSE(host.codecErrors.empty()) << "the codec reports the failed write";
-    EXPECT_TRUE(dest.GuardIntact());
-    EXPECT_LE(dest.size(), 200u);
-}
-
-TEST(FixedBuffer, SizeIsTheHighWaterMarkOfWriting) {
-    TestHost host;
-    DestinationFixture dest(host, DestKind::FixedBuffer);
-    ASSERT_EQ(OpenTIFFForWriting(host.ctx()), 1);
-    EXPECT_EQ(dest.size(), 0u) << "cleared at the open";
-    ASSERT_TRUE(WritePages(host->tiff, FileSpec{}));
-    host.EndJob();
-    EXPECT_EQ(dest.size(), host->memSize);
-    EXPECT_EQ(DecodeWithLibtiff(dest.Written()).size(), 1u);
-}
-
-TEST(DestinationFailure, CodecThatCannotWriteItsHeaderIsReported) {
-    TestHost host;
-    DestinationFixture dest(host, DestKind::FixedBuffer, 4);
-    const int opened = OpenTIFFForWriting(host.ctx());
-    if (opened == 0) {
-        EXPECT_TRUE(host.HasError("Unable to create TIFF object"));
-    } else {
-        EXPECT_FALSE(WritePages(host->tiff, FileSpec{}));
-    }
-    host.EndJob();
-    EXPECT_TRUE(dest.GuardIntact());
 }
 
 // ---------------------------------------------------------------- teardown
@@ -668,39 +483,28 @@ TEST(Teardown, MemorySourceIsNeverTakenForTheMemoryImage) {
     EXPECT_EQ(tiff, MakePages(1)) << "the host's data are untouched";
 }
 
-TEST(Teardown, JobWithNothingOpenIsHarmless) {
-    HandlerProbe probe;
-    TestHost host;
-    zanDestroyTIFF(host.ctx());
-    zanDestroyTIFF(host.ctx());
-    EXPECT_TRUE(HandlerProbe::InForce());
-    zanDestroyTIFF(nullptr);
-}
-
-// ------------------------------------------------------- failing allocations
+// ------------------------------------------- every kind, whatever fails
 
 // Runs `job` with the nth allocation failing, for n = 1, 2, … until a run
-// makes no more than n-1 allocations. Every run must end cleanly: handlers
-// restored, every block of the job released, and a failure reported.
+// makes no more than n-1 allocations, which must succeed. Every run must end
+// cleanly: a failure reported, the codec's handlers back, every block of the
+// job released.
 void SweepAllocationFailures(const std::function<bool(TestHost&)>& job) {
     for (int n = 1; n < 200; ++n) {
+        SCOPED_TRACE("allocation " + std::to_string(n));
         HandlerProbe probe;
         bool succeeded = false;
-        int calls = 0;
         {
             TestHost host;
             TestAllocator::Reset();
             TestAllocator::FailNthCall(n);
             succeeded = job(host);
-            calls = TestAllocator::Calls();
-            if (!succeeded) {
-                EXPECT_FALSE(host.Errors().empty()) << "allocation " << n;
-            }
-            host.EndJob();
+            if (!succeeded) { EXPECT_FALSE(host.Errors().empty()); }
         }
-        EXPECT_TRUE(HandlerProbe::InForce()) << "allocation " << n;
-        EXPECT_EQ(TestAllocator::LiveBlocks(), 0u) << "allocation " << n;
-        if (calls < n) {
+        EXPECT_TRUE(HandlerProbe::InForce());
+        EXPECT_EQ(TestAllocator::LiveBlocks(), 0u);
+        if (TestAllocator::Calls() < n) {
+            TestAllocator::Reset();
             EXPECT_TRUE(succeeded) << "a run without a failed allocation must succeed";
             return;
         }
@@ -708,32 +512,66 @@ void SweepAllocationFailures(const std::function<bool(TestHost&)>& job) {
     ADD_FAILURE() << "the job never got through";
 }
 
-TEST(FailingAllocations, EveryReadingJobEndsCleanly) {
+// Every kind of source delivers every page as libtiff decodes it, with the
+// job's handlers in force while open and a file source still open for its
+// owner afterwards; a trickling source behind the stream buffer is read once.
+TEST(ReadingOpen, EverySourceKindReadsEveryPageWhateverAllocationFails) {
     const Bytes tiff = MakeTiff(ThreePages());
-    for (SourceKind kind : {SourceKind::File, SourceKind::Memory, SourceKind::Callbacks,
-                            SourceKind::StreamBuffer}) {
-        SCOPED_TRACE(static_cast<int>(kind));
+    const auto pages = DecodeWithLibtiff(tiff);
+    for (SourceKind kind : kSources) {
+        SCOPED_TRACE(kSourceNames[static_cast<int>(kind)]);
         SweepAllocationFailures([&](TestHost& host) {
             SourceFixture source(host, kind, tiff);
+            if (kind == SourceKind::StreamBuffer) source.stream().maxChunk = 7;
             if (!OpenTIFFForReading(host.ctx())) return false;
-            if (DecodeAll(host->tiff).size() == 3) return true;
-            zanError(host.ctx(), "pages lost");  // a failure the job itself reports
-            return false;
+            EXPECT_FALSE(HandlerProbe::InForce());
+            if (!SamePages(DecodeAll(host->tiff), pages)) {
+                zanError(host.ctx(), "pages lost");  // a failure the job itself reports
+                return false;
+            }
+            host.EndJob();
+            EXPECT_EQ(host->tiff, nullptr);
+            if (source.fp()) { EXPECT_EQ(std::fseek(source.fp(), 0, SEEK_SET), 0) << "the file stays open"; }
+            if (kind == SourceKind::StreamBuffer) { EXPECT_LE(source.stream().bytesRead, tiff.size()); }
+            return host.Errors().empty();
         });
     }
 }
 
-TEST(FailingAllocations, EveryWritingJobEndsCleanly) {
-    for (DestKind kind : {DestKind::FileReopened, DestKind::Callbacks, DestKind::FixedBuffer,
-                          DestKind::GrowingMemory}) {
-        SCOPED_TRACE(static_cast<int>(kind));
+// Every kind of destination ends up holding the same multi-page file (a file
+// handed in read-only is reopened from its path). The host's size and image
+// variables are cleared at the open; a growing image starts at half the frame
+// buffer plus 60 bytes and is handed over from the job's allocator, the only
+// block left.
+TEST(WritingOpen, EveryDestinationHoldsTheSameFileWhateverAllocationFails) {
+    const auto pages = DecodeWithLibtiff(MakeTiff(ThreePages()));
+    Bytes reference;
+    for (DestKind kind : kDests) {
+        SCOPED_TRACE(kDestNames[static_cast<int>(kind)]);
+        const bool growing = kind == DestKind::GrowingMemory;
         SweepAllocationFailures([&](TestHost& host) {
             DestinationFixture dest(host, kind);
+            host->frameBufferSize = 1001;
             if (!OpenTIFFForWriting(host.ctx())) return false;
-            const bool ok = WritePages(host->tiff, TwoPages());
+            if (kind == DestKind::FixedBuffer || growing) { EXPECT_EQ(dest.size(), 0u); }
+            if (growing) {
+                EXPECT_EQ(dest.block(), nullptr);
+                EXPECT_EQ(host->memCapacity, 500u + 60u);
+            }
+            const bool ok = WritePages(host->tiff, ThreePages());
             if (!ok) zanError(host.ctx(), "pages not written");
             host.EndJob();
-            return ok && DecodeWithLibtiff(dest.Written()).size() == 2;
+            if (!ok || !host.Errors().empty()) return false;
+            const Bytes written = dest.Written();
+            if (reference.empty()) reference = written;
+            EXPECT_EQ(written, reference) << "the same bytes, size included, on every destination";
+            EXPECT_TRUE(SamePages(DecodeWithLibtiff(written), pages));
+            EXPECT_EQ(TestAllocator::LiveBlocks(), growing ? 1u : 0u);
+            if (growing) {
+                EXPECT_TRUE(TestAllocator::Owns(dest.block()));
+                EXPECT_EQ(host->memBase, nullptr) << "the module no longer holds the image";
+            }
+            return true;
         });
     }
 }

@@ -55,7 +55,6 @@ TEST(MetadataReading, ImageTagsComeInTableOrderWithTheirForms) {
     const auto image = job.Entries(ZAN_METADATA_IMAGE);
     std::vector<uint32_t> tags;
     for (const auto* e : image) tags.push_back(e->tag);
-    EXPECT_TRUE(std::is_sorted(tags.begin(), tags.end()));
     EXPECT_EQ(tags, (std::vector<uint32_t>{269, 270, 282, 283, 296}));
     const MetadataEntry* description = job.Find(270);
     EXPECT_EQ(description->type, static_cast<uint32_t>(ZAN_METADATA_BLOCK));
@@ -72,7 +71,7 @@ TEST(MetadataReading, ImageTagsComeInTableOrderWithTheirForms) {
     EXPECT_TRUE(job.Entries(ZAN_METADATA_EXIF).empty());
 }
 
-TEST(MetadataReading, ExifTagsArriveInTheirForms) {
+TEST(MetadataReading, ExifTagsArriveInTheirFormsAndThePageStaysReadable) {
     MetadataJob job(MakeExifTiff());
     ASSERT_EQ(job.GetInfo(), 1);
     const MetadataEntry* version = job.Find(EXIFTAG_EXIFVERSION);
@@ -93,16 +92,11 @@ TEST(MetadataReading, ExifTagsArriveInTheirForms) {
     EXPECT_FLOAT_EQ(fnumber->value.f32, 2.8f);
     const MetadataEntry* date = job.Find(EXIFTAG_DATETIMEORIGINAL);
     ASSERT_NE(date, nullptr);
+    EXPECT_EQ(date->group, static_cast<uint32_t>(ZAN_METADATA_EXIF));
     EXPECT_STREQ(static_cast<const char*>(date->value.block), "2024:05:06 07:08:09");
-    for (const auto* e : job.Entries(ZAN_METADATA_EXIF)) EXPECT_EQ(e->group, 4u);
-}
-
-TEST(MetadataReading, ImageDirectoryIsCurrentAgainAfterTheExifDirectory) {
-    MetadataJob job(MakeExifTiff());
-    ASSERT_EQ(job.GetInfo(), 1);
+    // The image directory is current again after the EXIF directory.
     EXPECT_EQ(TIFFCurrentDirectory(job->tiff), 0u);
-    const auto rows = job.ReadAll();
-    EXPECT_EQ(rows.size(), 8u) << "the page is still readable";
+    EXPECT_EQ(job.ReadAll().size(), 8u);
 }
 
 TEST(MetadataReading, StreamSourcesKeepTheirPageReadableAndSkipExif) {

@@ -2,11 +2,10 @@
 
 #include <gtest/gtest.h>
 
-#include <cstring>
-
 #include <vector>
 
 #include "osttiff/osttiff.h"
+#include "support/memory_stream.h"
 #include "support/test_host.h"
 #include "support/tiff_fixtures.h"
 
@@ -14,49 +13,28 @@ namespace {
 
 using namespace zantest;
 
-// A 32-bit client over bytes in memory that records what libtiff asked.
+// A 32-bit client over a MemoryStream.
 struct Client {
-    Bytes data;
-    uint64_t position = 0;
+    MemoryStream stream;
     int closes = 0;
     bool failSeeks = false;
     int64_t shortWritesAfter = -1;  // >= 0: writes past this many bytes come up short
-    std::vector<uint32_t> seekOffsets;
 
-    static int32_t Read(void* c, void* buffer, int32_t n) {
-        auto* self = static_cast<Client*>(c);
-        if (self->position >= self->data.size()) return 0;
-        const auto count = static_cast<int32_t>(
-            std::min<uint64_t>(static_cast<uint64_t>(n), self->data.size() - self->position));
-        std::memcpy(buffer, self->data.data() + self->position, static_cast<size_t>(count));
-        self->position += static_cast<uint64_t>(count);
-        return count;
-    }
+    static Client& Of(void* c) { return *static_cast<Client*>(c); }
+    static int32_t Read(void* c, void* buffer, int32_t n) { return MemoryStream::Read(buffer, n, &Of(c).stream); }
     static int32_t Write(void* c, void* buffer, int32_t n) {
-        auto* self = static_cast<Client*>(c);
-        int32_t count = n;
-        if (self->shortWritesAfter >= 0 &&
-            self->position + static_cast<uint64_t>(n) > static_cast<uint64_t>(self->shortWritesAfter))
-            count = n / 2;
-        if (self->data.size() < self->position + count) self->data.resize(self->position + count);
-        std::memcpy(self->data.data() + self->position, buffer, static_cast<size_t>(count));
-        self->position += static_cast<uint64_t>(count);
-        return count;
+        const int64_t limit = Of(c).shortWritesAfter;
+        const bool cut = limit >= 0 && static_cast<int64_t>(Of(c).stream.position) + n > limit;
+        return MemoryStream::Write(buffer, cut ? n / 2 : n, &Of(c).stream);
     }
     static uint32_t Seek(void* c, uint32_t offset, int whence) {
-        auto* self = static_cast<Client*>(c);
-        self->seekOffsets.push_back(offset);
-        if (self->failSeeks) return PIVLO_SEEK_FAILED;
-        if (whence == SEEK_SET) self->position = offset;
-        else if (whence == SEEK_CUR) self->position += static_cast<int32_t>(offset);
-        else self->position = self->data.size() + static_cast<int32_t>(offset);
-        return static_cast<uint32_t>(self->position);
+        return Of(c).failSeeks ? PIVLO_SEEK_FAILED : MemoryStream::Seek(offset, whence, &Of(c).stream);
     }
     static int Close(void* c) {
-        ++static_cast<Client*>(c)->closes;
+        ++Of(c).closes;
         return 0;
     }
-    static uint32_t Size(void* c) { return static_cast<uint32_t>(static_cast<Client*>(c)->data.size()); }
+    static uint32_t Size(void* c) { return static_cast<uint32_t>(Of(c).stream.data.size()); }
 
     TIFF* Open(const char* mode, PivloAllocProc alloc = TestAllocator::Alloc,
                PivloFreeProc release = TestAllocator::Free) {
@@ -65,53 +43,60 @@ struct Client {
     }
 };
 
+// Codec messages are silenced; every test must leave no block of the
+// allocator behind.
 class ClientOpenTest : public ::testing::Test {
 protected:
-    void SetUp() override {
-        previous_ = TIFFSetErrorHandler(nullptr);
-        previousWarning_ = TIFFSetWarningHandler(nullptr);
-        TestAllocator::Reset();
-    }
+    void SetUp() override { TestAllocator::Reset(); }
     void TearDown() override {
-        TIFFSetErrorHandler(previous_);
+        TIFFSetErrorHandler(previousError_);
         TIFFSetWarningHandler(previousWarning_);
         EXPECT_EQ(TestAllocator::LiveBlocks(), 0u);
     }
-    TIFFErrorHandler previous_ = nullptr;
-    TIFFErrorHandler previousWarning_ = nullptr;
+    TIFFErrorHandler previousError_ = TIFFSetErrorHandler(nullptr);
+    TIFFErrorHandler previousWarning_ = TIFFSetWarningHandler(nullptr);
 };
 
-TEST_F(ClientOpenTest, ReadsEveryPageThroughThe32BitProcedures) {
-    Client client;
-    client.data = MakePages(3);
-    TIFF* tif = client.Open("r");
-    ASSERT_NE(tif, nullptr);
-    EXPECT_EQ(TIFFClientdataPivlo(tif), &client);
-    EXPECT_EQ(TIFFNumberOfDirectories(tif), 3u);
-    std::vector<uint8_t> strip(static_cast<size_t>(TIFFStripSize(tif)));
-    EXPECT_GT(TIFFReadEncodedStrip(tif, 0, strip.data(), -1), 0);
-    EXPECT_EQ(TIFFIOFailedPivlo(tif), 0);
-    TIFFClose(tif);
-    EXPECT_EQ(client.closes, 1) << "the close procedure runs once, at TIFFClose";
-}
-
-TEST_F(ClientOpenTest, WritesAndAppendsPages) {
+// A page written, one appended, both read back; the close procedure runs
+// once for each object, at TIFFClose.
+TEST_F(ClientOpenTest, WritesAppendsAndReadsThroughThe32BitProcedures) {
     Client client;
     TIFF* tif = client.Open("w");
     ASSERT_NE(tif, nullptr);
     ASSERT_TRUE(WritePages(tif, FileSpec{}));
     TIFFClose(tif);
-    client.position = 0;
-    tif = client.Open("a");
-    ASSERT_NE(tif, nullptr);
+    EXPECT_EQ(client.closes, 1);
+    client.stream.position = 0;
+    ASSERT_NE(tif = client.Open("a"), nullptr);
     ASSERT_TRUE(WritePages(tif, FileSpec{}, 1));
+    EXPECT_EQ(TIFFIOFailedPivlo(tif), 0);
     TIFFClose(tif);
-    EXPECT_EQ(DecodeWithLibtiff(client.data).size(), 2u);
+    client.stream.position = 0;
+    ASSERT_NE(tif = client.Open("r"), nullptr);
+    EXPECT_EQ(TIFFClientdataPivlo(tif), &client);
+    EXPECT_EQ(TIFFNumberOfDirectories(tif), 2u);
+    std::vector<uint8_t> strip(static_cast<size_t>(TIFFStripSize(tif)));
+    EXPECT_GT(TIFFReadEncodedStrip(tif, 0, strip.data(), -1), 0);
+    TIFFClose(tif);
+    EXPECT_EQ(client.closes, 3);
 }
 
+TEST_F(ClientOpenTest, ShortWriteIsRemembered) {
+    Client client;
+    client.shortWritesAfter = 40;
+    TIFF* tif = client.Open("w");
+    ASSERT_NE(tif, nullptr);
+    WritePages(tif, FileSpec{});
+    EXPECT_EQ(TIFFIOFailedPivlo(tif), 1);
+    TIFFClose(tif);
+}
+
+// The context slot starts empty and keeps what the job puts there; strip
+// offsets and counts come as 32-bit values. Objects not opened here have
+// neither client data nor context.
 TEST_F(ClientOpenTest, ContextSlotAndOffsetsOf32Bits) {
     Client client;
-    client.data = MakePages(1);
+    client.stream.data = MakePages(1);
     TIFF* tif = client.Open("rc");
     ASSERT_NE(tif, nullptr);
     EXPECT_EQ(TIFFGetContextPivlo(tif), nullptr);
@@ -125,53 +110,39 @@ TEST_F(ClientOpenTest, ContextSlotAndOffsetsOf32Bits) {
     EXPECT_EQ(count, 16u * 8u);
     EXPECT_EQ(TIFFGetStrileOffset32(tif, 5, &offset), 0) << "index beyond the strips";
     TIFFClose(tif);
-}
 
-TEST_F(ClientOpenTest, FailingSeekFailsTheOpenWithoutCallingClose) {
-    Client client;
-    client.data = MakePages(1);
-    client.failSeeks = true;
-    EXPECT_EQ(client.Open("r"), nullptr);
-    EXPECT_EQ(client.closes, 0);
-}
-
-TEST_F(ClientOpenTest, ShortWriteIsRemembered) {
-    Client client;
-    client.shortWritesAfter = 40;
-    TIFF* tif = client.Open("w");
-    ASSERT_NE(tif, nullptr);
-    WritePages(tif, FileSpec{});
-    EXPECT_EQ(TIFFIOFailedPivlo(tif), 1);
-    TIFFClose(tif);
-}
-
-TEST_F(ClientOpenTest, AdapterWithoutMemoryFailsTheOpen) {
-    Client client;
-    client.data = MakePages(1);
-    TestAllocator::FailNthCall(1);
-    EXPECT_EQ(client.Open("r"), nullptr);
-    TestAllocator::Reset();
-    TIFF* tif = client.Open("r", nullptr, nullptr);  // the C heap without host procedures
-    ASSERT_NE(tif, nullptr);
-    void* own = PivloMalloc(tif, 32);
-    EXPECT_NE(own, nullptr);
-    PivloFree(tif, own);
-    TIFFClose(tif);
-}
-
-TEST_F(ClientOpenTest, ObjectsNotOpenedHereHaveNoClientData) {
     TempFile file;
-    WriteFileBytes(file.path(), MakePages(1));
-    TIFF* tif = TIFFOpen(file.c_str(), "r");
-    ASSERT_NE(tif, nullptr);
+    WriteFileBytes(file.path(), client.stream.data);
+    ASSERT_NE(tif = TIFFOpen(file.c_str(), "r"), nullptr);
     EXPECT_EQ(TIFFClientdataPivlo(tif), nullptr);
     EXPECT_EQ(TIFFGetContextPivlo(tif), nullptr);
     TIFFClose(tif);
 }
 
-TEST_F(ClientOpenTest, BadModeIsRefused) {
+// A failing seek, a bad mode or an adapter without memory: no object, and
+// the close procedure is not called.
+TEST_F(ClientOpenTest, RefusedOpenReturnsNothingWithoutCallingClose) {
+    for (int fault = 0; fault < 3; ++fault) {
+        SCOPED_TRACE(fault);
+        Client client;
+        client.stream.data = MakePages(1);
+        client.failSeeks = fault == 0;
+        if (fault == 2) TestAllocator::FailNthCall(1);
+        EXPECT_EQ(client.Open(fault == 1 ? "x" : "r"), nullptr);
+        EXPECT_EQ(client.closes, 0);
+        TestAllocator::Reset();
+    }
+}
+
+TEST_F(ClientOpenTest, WithoutHostAllocatorsTheCHeapServes) {
     Client client;
-    EXPECT_EQ(client.Open("x"), nullptr);
+    client.stream.data = MakePages(1);
+    TIFF* tif = client.Open("r", nullptr, nullptr);
+    ASSERT_NE(tif, nullptr);
+    void* own = PivloMalloc(tif, 32);
+    EXPECT_NE(own, nullptr);
+    PivloFree(tif, own);
+    TIFFClose(tif);
 }
 
 }  // namespace

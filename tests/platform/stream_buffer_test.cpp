@@ -17,24 +17,28 @@ using zantest::MemoryStream;
 using zantest::TestAllocator;
 using zantest::TestHost;
 
+constexpr uint32_t Back(uint32_t n) { return 0u - n; }  // a backward move as a wrapped offset
+
+// A service over a 1000-byte source whose byte i holds i & 0xFF, in 64-byte
+// blocks; closing it must release every block.
 class StreamBufferTest : public ::testing::Test {
 protected:
     void SetUp() override {
         source_.data.resize(1000);
-        std::iota(source_.data.begin(), source_.data.end(), 0);  // byte i holds i & 0xFF
-        Open(1, 64);
+        std::iota(source_.data.begin(), source_.data.end(), 0);
+        Open(1);
     }
-    void TearDown() override { Close(); }
+    void TearDown() override {
+        StreamBufferClose(host_.ctx(), sb_);
+        EXPECT_EQ(TestAllocator::LiveBlocks(), 0u) << "closing releases everything";
+    }
 
-    void Open(int retain, uint32_t blockSize) {
+    void Open(int retain) {
         StreamDescriptor desc{PIVLO_STREAM_READ_CALLBACK, MemoryStream::Read, &source_, 7};
-        sb_ = StreamBufferInit_(host_.ctx(), &desc, host_->errorProc, retain, 1, blockSize);
+        sb_ = StreamBufferInit_(host_.ctx(), &desc, host_->errorProc, retain, 1, 64);
         ASSERT_NE(sb_, nullptr);
     }
-    void Close() {
-        StreamBufferClose(host_.ctx(), sb_);
-        sb_ = nullptr;
-    }
+    // What a read of `n` bytes delivers; `got` receives its result.
     std::vector<uint8_t> Read(int32_t n, int32_t* got = nullptr) {
         std::vector<uint8_t> out(static_cast<size_t>(n));
         const int32_t r = StreamBufferRead(host_.ctx(), sb_, out.data(), n);
@@ -42,9 +46,14 @@ protected:
         out.resize(r > 0 ? static_cast<size_t>(r) : 0);
         return out;
     }
+    int32_t ReadResult(int32_t n) {
+        int32_t got = 0;
+        Read(n, &got);
+        return got;
+    }
     static std::vector<uint8_t> Bytes(uint32_t from, uint32_t count) {
         std::vector<uint8_t> b(count);
-        for (uint32_t i = 0; i < count; ++i) b[i] = static_cast<uint8_t>(from + i);
+        std::iota(b.begin(), b.end(), static_cast<uint8_t>(from));
         return b;
     }
 
@@ -53,49 +62,52 @@ protected:
     StreamBuffer* sb_ = nullptr;
 };
 
+// Also from a source that delivers three bytes at a time.
 TEST_F(StreamBufferTest, ReadsTheSourceOnlyAsFarAsAsked) {
+    source_.maxChunk = 3;
     EXPECT_EQ(Read(10), Bytes(0, 10));
     EXPECT_EQ(source_.bytesRead, 10u);
     EXPECT_EQ(StreamBufferSeek(sb_, 500, 0), 500u);
     EXPECT_EQ(source_.bytesRead, 10u) << "a seek alone reads nothing";
-    EXPECT_EQ(Read(4), Bytes(500, 4));
-    EXPECT_EQ(source_.bytesRead, 504u);
+    EXPECT_EQ(Read(100), Bytes(500, 100));
+    EXPECT_EQ(source_.bytesRead, 600u);
 }
 
+// Skipped data are kept for backward seeks, and no byte is read from the
+// source twice; a seek before the start or with an unknown whence fails and
+// keeps the position.
 TEST_F(StreamBufferTest, ServesBackwardSeeksFromKeptData) {
     StreamBufferSeek(sb_, 300, 0);
     Read(20);
     EXPECT_EQ(StreamBufferSeek(sb_, 100, 0), 100u);
-    EXPECT_EQ(Read(50), Bytes(100, 50)) << "skipped data was kept";
-    EXPECT_EQ(StreamBufferSeek(sb_, static_cast<uint32_t>(-30), 1), 120u);
+    EXPECT_EQ(Read(50), Bytes(100, 50));
+    EXPECT_EQ(StreamBufferSeek(sb_, Back(30), 1), 120u);
+    EXPECT_EQ(StreamBufferSeek(sb_, Back(121), 1), PIVLO_STREAM_FAILED);
+    EXPECT_EQ(StreamBufferSeek(sb_, 0, 9), PIVLO_STREAM_FAILED);
     EXPECT_EQ(StreamBufferSeek(sb_, 0, 1), 120u);
-    EXPECT_EQ(source_.bytesRead, 320u) << "no byte is read from the source twice";
+    EXPECT_EQ(source_.bytesRead, 320u);
 }
 
+// Released bytes cannot be read again (a failure with a message); a block
+// goes once released whole, also by overlapping ranges; the bytes after a
+// range stay. An inverted range is refused.
 TEST_F(StreamBufferTest, ReleasedDataCannotBeReadAgainAndItsBlocksAreFreed) {
     Read(256);
-    const size_t blocksBefore = TestAllocator::LiveBlocks();
+    const size_t before = TestAllocator::LiveBlocks();
     EXPECT_EQ(StreamBufferDiscardData(host_.ctx(), sb_, 0, 127), 0);
-    EXPECT_EQ(TestAllocator::LiveBlocks(), blocksBefore - 2) << "two whole 64-byte blocks";
+    EXPECT_EQ(TestAllocator::LiveBlocks(), before - 2) << "two whole 64-byte blocks";
     EXPECT_EQ(StreamBufferDiscardData(host_.ctx(), sb_, 128, 150), 0);
-    EXPECT_EQ(TestAllocator::LiveBlocks(), blocksBefore - 2) << "a partly released block stays";
+    EXPECT_EQ(TestAllocator::LiveBlocks(), before - 2) << "a partly released block stays";
     StreamBufferSeek(sb_, 140, 0);
-    int32_t got = 0;
-    Read(4, &got);
-    EXPECT_EQ(got, -1);
+    EXPECT_EQ(ReadResult(4), -1);
     ASSERT_FALSE(host_.codecErrors.empty());
     EXPECT_EQ(host_.codecErrors.back().code, PIVLO_STREAM_MESSAGE_CODE);
     StreamBufferSeek(sb_, 151, 0);
-    EXPECT_EQ(Read(4), Bytes(151, 4)) << "the bytes after the range are still there";
+    EXPECT_EQ(Read(4), Bytes(151, 4));
+    StreamBufferDiscardData(host_.ctx(), sb_, 140, 170);
+    StreamBufferDiscardData(host_.ctx(), sb_, 165, 191);
+    EXPECT_EQ(TestAllocator::LiveBlocks(), before - 3) << "overlapping ranges merge";
     EXPECT_EQ(StreamBufferDiscardData(host_.ctx(), sb_, 10, 9), -1);
-}
-
-TEST_F(StreamBufferTest, OverlappingReleasesMergeIntoWholeBlocks) {
-    Read(192);
-    const size_t before = TestAllocator::LiveBlocks();
-    StreamBufferDiscardData(host_.ctx(), sb_, 64, 100);
-    StreamBufferDiscardData(host_.ctx(), sb_, 90, 127);
-    EXPECT_EQ(TestAllocator::LiveBlocks(), before - 1);
 }
 
 TEST_F(StreamBufferTest, DataReleasedBeforeItArrivesIsNeverKept) {
@@ -105,77 +117,53 @@ TEST_F(StreamBufferTest, DataReleasedBeforeItArrivesIsNeverKept) {
     EXPECT_LE(TestAllocator::LiveBlocks(), 4u) << "only blocks from 512 on are held";
 }
 
+// The size is learnt by reading to the end, only when asked; the position
+// stays, and a read at the end returns what is left, then 0.
 TEST_F(StreamBufferTest, SizeIsLearntByReadingToTheEndOnlyWhenAsked) {
     Read(5);
     EXPECT_EQ(source_.bytesRead, 5u);
     EXPECT_EQ(StreamBufferSourceSize(sb_), 1000u);
     EXPECT_EQ(source_.bytesRead, 1000u);
-    EXPECT_EQ(StreamBufferSeek(sb_, 0, 1), 5u) << "the position is kept";
-    EXPECT_EQ(StreamBufferSeek(sb_, static_cast<uint32_t>(-10), 2), 990u);
-    EXPECT_EQ(Read(20), Bytes(990, 10)) << "a read at the end returns what is left";
-    int32_t got = -2;
-    Read(1, &got);
-    EXPECT_EQ(got, 0);
+    EXPECT_EQ(StreamBufferSeek(sb_, 0, 1), 5u);
+    EXPECT_EQ(StreamBufferSeek(sb_, Back(10), 2), 990u);
+    EXPECT_EQ(Read(20), Bytes(990, 10));
+    EXPECT_EQ(ReadResult(1), 0);
 }
 
-TEST_F(StreamBufferTest, SeeksBeforeTheStartFailAndKeepThePosition) {
-    StreamBufferSeek(sb_, 10, 0);
-    EXPECT_EQ(StreamBufferSeek(sb_, static_cast<uint32_t>(-11), 1), PIVLO_STREAM_FAILED);
-    EXPECT_EQ(StreamBufferSeek(sb_, 0, 1), 10u);
-    EXPECT_EQ(StreamBufferSeek(sb_, 0, 9), PIVLO_STREAM_FAILED);
-}
-
-TEST_F(StreamBufferTest, TricklingSourceIsReadUntilTheRequestIsMet) {
-    source_.maxChunk = 3;
-    EXPECT_EQ(Read(100), Bytes(0, 100));
-}
-
-TEST_F(StreamBufferTest, FailingSourceFailsTheReadWithAMessage) {
-    source_.failReads = true;
-    int32_t got = 0;
-    Read(10, &got);
-    EXPECT_EQ(got, -1);
-    EXPECT_EQ(StreamBufferSourceSize(sb_), PIVLO_STREAM_FAILED);
-    ASSERT_FALSE(host_.codecErrors.empty());
-    EXPECT_EQ(host_.codecErrors[0],
-              (CodecMessage{PIVLO_STREAM_MESSAGE_CODE, "Stream buffer: the source could not be read"}));
-}
-
-TEST_F(StreamBufferTest, MemoryShortageFailsTheRead) {
+// Memory refused, then a source that fails: each fails the read with its
+// message; after the first a later read can succeed, after the second the
+// size cannot be learnt.
+TEST_F(StreamBufferTest, FailuresFailTheReadWithAMessage) {
     TestAllocator::FailNthCall(1);
-    int32_t got = 0;
-    Read(10, &got);
-    EXPECT_EQ(got, -1);
-    EXPECT_EQ(host_.codecErrors.back().text, "Stream buffer: memory allocation failed");
-    EXPECT_EQ(Read(10), Bytes(0, 10)) << "a later read can succeed";
+    EXPECT_EQ(ReadResult(10), -1);
+    EXPECT_EQ(host_.codecErrors.back(),
+              (CodecMessage{PIVLO_STREAM_MESSAGE_CODE, "Stream buffer: memory allocation failed"}));
+    EXPECT_EQ(Read(10), Bytes(0, 10));
+    source_.failReads = true;
+    EXPECT_EQ(ReadResult(100), -1);
+    EXPECT_EQ(host_.codecErrors.back(),
+              (CodecMessage{PIVLO_STREAM_MESSAGE_CODE, "Stream buffer: the source could not be read"}));
+    EXPECT_EQ(StreamBufferSourceSize(sb_), PIVLO_STREAM_FAILED);
 }
 
 TEST_F(StreamBufferTest, ForwardOnlyModeReleasesWhatLiesBehind) {
-    Close();
-    Open(0, 64);
+    StreamBufferClose(host_.ctx(), sb_);
+    Open(0);
     Read(300);
     EXPECT_LE(TestAllocator::LiveBlocks(), 3u) << "handle plus the block in use";
     StreamBufferSeek(sb_, 0, 0);
-    int32_t got = 0;
-    Read(4, &got);
-    EXPECT_EQ(got, -1);
+    EXPECT_EQ(ReadResult(4), -1);
 }
 
-TEST_F(StreamBufferTest, CloseReleasesEverything) {
-    StreamBufferSourceSize(sb_);
-    Close();
-    EXPECT_EQ(TestAllocator::LiveBlocks(), 0u);
-    Open(1, 64);  // for TearDown
-}
-
+// A wrong kind, no read function or no descriptor: refused with a message,
+// unless the caller asked for quiet.
 TEST(StreamBufferInit, UnusableDescriptorsAreRefusedWithAMessage) {
     TestHost host;
     host.UseExSinks();
     StreamDescriptor wrongKind{3, MemoryStream::Read, nullptr, 0};
     StreamDescriptor noRead{PIVLO_STREAM_READ_CALLBACK, nullptr, nullptr, 0};
-    EXPECT_EQ(StreamBufferInit2_(host.ctx(), &wrongKind, host->errorProcEx, &host, 1, 1, 0), nullptr);
-    EXPECT_EQ(StreamBufferInit2_(host.ctx(), &noRead, host->errorProcEx, &host, 1, 1, 0), nullptr);
-    EXPECT_EQ(StreamBufferInit2_(host.ctx(), nullptr, host->errorProcEx, &host, 1, 1, 0), nullptr);
+    for (StreamDescriptor* desc : {&wrongKind, &noRead, static_cast<StreamDescriptor*>(nullptr)})
+        EXPECT_EQ(StreamBufferInit2_(host.ctx(), desc, host->errorProcEx, &host, 1, 1, 0), nullptr);
     EXPECT_EQ(host.codecErrors.size(), 3u);
     EXPECT_EQ(StreamBufferInit_(host.ctx(), &noRead, nullptr, 1, 0, 0), nullptr);
     EXPECT_EQ(host.codecErrors.size(), 3u) << "reportErrors 0 keeps quiet";

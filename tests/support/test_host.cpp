@@ -161,8 +161,6 @@ void TestHost::EndJob() {
 
 std::vector<std::string> TestHost::Errors() const { return TextsOf(messages, 0); }
 std::vector<std::string> TestHost::Warnings() const { return TextsOf(messages, 1); }
-std::vector<std::string> TestHost::Traces() const { return TextsOf(messages, 2); }
-
 bool TestHost::HasError(const std::string& text) const {
     const auto errors = Errors();
     return std::find(errors.begin(), errors.end(), text) != errors.end();

@@ -64,7 +64,6 @@ public:
 
     std::vector<std::string> Errors() const;    // host error texts, in order
     std::vector<std::string> Warnings() const;
-    std::vector<std::string> Traces() const;
     bool HasError(const std::string& text) const;
     void ClearMessages();
 

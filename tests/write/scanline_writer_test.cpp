@@ -6,6 +6,8 @@
 
 #include <cmath>
 #include <cstring>
+#include <functional>
+#include <map>
 
 #include <tiffio.h>
 
@@ -49,12 +51,27 @@ std::vector<Bytes> ReadBackWithModule(const Bytes& tiff, uint32_t outputBits) {
     return rows;
 }
 
+// One 8-bit page of pattern rows written with what `setup` adds; its bytes.
+Bytes WritePage(uint32_t colorSpace, uint32_t width, uint32_t height, uint32_t compression,
+                const std::function<void(WriteJob&)>& setup = {}) {
+    WriteJob job;
+    job.Describe(colorSpace, width, height, compression);
+    if (setup) setup(job);
+    EXPECT_TRUE(job.WriteRows(PatternRows(height, RowBytes(kLayouts[colorSpace - 1], width, 8))));
+    return job.Finish();
+}
+
 TEST(ScanlineWriter, EveryColourSpaceAndLosslessCompressionRoundTrips) {
     const uint32_t width = 21, height = 11;
+    // Code 9 is no compression.
+    const std::map<uint32_t, uint16_t> tagOf = {{1, COMPRESSION_NONE},     {2, COMPRESSION_PACKBITS},
+                                                {3, COMPRESSION_CCITTFAX3}, {4, COMPRESSION_CCITTFAX4},
+                                                {7, COMPRESSION_LZW},       {9, COMPRESSION_NONE},
+                                                {12, COMPRESSION_DEFLATE}};
     for (const Layout& l : kLayouts) {
         const bool bilevel = l.colorSpace == 1 || l.colorSpace == 4;
         const std::vector<uint32_t> compressions =
-            l.colorSpace == 1 ? std::vector<uint32_t>{1, 3, 4} : std::vector<uint32_t>{1, 2, 7, 12};
+            l.colorSpace == 1 ? std::vector<uint32_t>{1, 3, 4} : std::vector<uint32_t>{1, 2, 7, 9, 12};
         for (uint32_t bits : bilevel ? std::vector<uint32_t>{8} : std::vector<uint32_t>{8, 16})
             for (uint32_t compression : compressions) {
                 SCOPED_TRACE(::testing::Message() << "colour space " << l.colorSpace << ", compression "
@@ -69,6 +86,7 @@ TEST(ScanlineWriter, EveryColourSpaceAndLosslessCompressionRoundTrips) {
                 const Bytes tiff = job.Finish();
                 PageReader page(tiff);
                 ASSERT_NE(page.get(), nullptr);
+                EXPECT_EQ(page.U16(TIFFTAG_COMPRESSION), tagOf.at(compression));
                 EXPECT_EQ(page.U16(TIFFTAG_SAMPLESPERPIXEL), l.samples);
                 EXPECT_EQ(page.U16(TIFFTAG_BITSPERSAMPLE), bilevel ? 1u : bits);
                 EXPECT_EQ(page.U16(TIFFTAG_PHOTOMETRIC), l.photometric);
@@ -90,57 +108,35 @@ TEST(ScanlineWriter, EveryColourSpaceAndLosslessCompressionRoundTrips) {
     }
 }
 
-TEST(ScanlineWriter, CompressionTagsOfEachCode) {
-    struct Case {
-        uint32_t code;
-        uint16_t compression;
-    } cases[] = {{1, COMPRESSION_NONE}, {2, COMPRESSION_PACKBITS}, {7, COMPRESSION_LZW}, {12, COMPRESSION_DEFLATE},
-                 {9, COMPRESSION_NONE}};
-    for (const Case& c : cases) {
-        WriteJob job;
-        job.Describe(2, 8, 4, c.code);
-        job->lzwPredictor = 2;
-        ASSERT_TRUE(job.WriteRows(PatternRows(4, 8)));
-        PageReader page(job.Finish());
-        EXPECT_EQ(page.U16(TIFFTAG_COMPRESSION), c.compression) << c.code;
-        if (c.code == 7) {
-            EXPECT_EQ(page.U16(TIFFTAG_PREDICTOR), 2u);
-        }
-    }
-}
-
-TEST(ScanlineWriter, Group3PagesGetTheirDefaults) {
-    WriteJob job;
-    job.Describe(1, 100, 20, 3);
-    ASSERT_TRUE(job.WriteRows(PatternRows(20, 13)));
-    PageReader page(job.Finish());
-    EXPECT_EQ(page.U32(TIFFTAG_SUBFILETYPE), static_cast<uint32_t>(FILETYPE_PAGE));
+TEST(ScanlineWriter, FaxPagesGetTheirTags) {
+    PageReader g3(WritePage(1, 100, 20, 3));
+    EXPECT_EQ(g3.U32(TIFFTAG_SUBFILETYPE), static_cast<uint32_t>(FILETYPE_PAGE));
     uint16_t number = 9, of = 9;
-    ASSERT_TRUE(TIFFGetField(page.get(), TIFFTAG_PAGENUMBER, &number, &of));
+    ASSERT_TRUE(TIFFGetField(g3.get(), TIFFTAG_PAGENUMBER, &number, &of));
     EXPECT_EQ(number, 0);
     EXPECT_EQ(of, 1);
-    EXPECT_EQ(page.U16(TIFFTAG_FILLORDER), static_cast<uint32_t>(FILLORDER_LSB2MSB));
-    EXPECT_EQ(page.U32(TIFFTAG_GROUP3OPTIONS), 0u);
-    EXPECT_EQ(page.U32(TIFFTAG_ROWSPERSTRIP), 20u);
-    EXPECT_EQ(page.Text(TIFFTAG_SOFTWARE), TIFFGetVersionLinePivlo()) << "the version came first";
-    EXPECT_EQ(page.U16(TIFFTAG_PHOTOMETRIC), 1u);
-}
-
-TEST(ScanlineWriter, Group4OptionsOnlyWhenAsked) {
+    EXPECT_EQ(g3.U16(TIFFTAG_FILLORDER), static_cast<uint32_t>(FILLORDER_LSB2MSB));
+    EXPECT_EQ(g3.U32(TIFFTAG_GROUP3OPTIONS), 0u);
+    EXPECT_EQ(g3.U32(TIFFTAG_ROWSPERSTRIP), 20u);
+    EXPECT_EQ(g3.Text(TIFFTAG_SOFTWARE), TIFFGetVersionLinePivlo()) << "the version came first";
+    EXPECT_EQ(g3.U16(TIFFTAG_PHOTOMETRIC), 1u);
     for (uint32_t set : {0u, 1u}) {
-        WriteJob job;
-        job.Describe(1, 100, 4, 4);
-        job->whiteIsZero = 1;
-        job->t6OptionsSet = set;
-        job->t6Options = 0;
-        ASSERT_TRUE(job.WriteRows(PatternRows(4, 13)));
-        PageReader page(job.Finish());
-        EXPECT_EQ(page.U16(TIFFTAG_PHOTOMETRIC), 0u);
-        EXPECT_EQ(page.U32(TIFFTAG_GROUP4OPTIONS) != 0xFFFFFFFFu, set != 0);
+        PageReader g4(WritePage(1, 100, 4, 4, [set](WriteJob& job) {
+            job->whiteIsZero = 1;
+            job->t6OptionsSet = set;
+            job->t6Options = 0;
+        }));
+        EXPECT_EQ(g4.U16(TIFFTAG_PHOTOMETRIC), 0u);
+        EXPECT_EQ(g4.U32(TIFFTAG_GROUP4OPTIONS) != 0xFFFFFFFFu, set != 0) << "Group 4 options only when asked";
     }
 }
 
-TEST(ScanlineWriter, JpegColourPagesAreStoredAsYCbCr) {
+TEST(ScanlineWriter, LzwPredictorIsWrittenWhenAsked) {
+    PageReader page(WritePage(2, 8, 4, 7, [](WriteJob& job) { job->lzwPredictor = 2; }));
+    EXPECT_EQ(page.U16(TIFFTAG_PREDICTOR), 2u);
+}
+
+TEST(ScanlineWriter, JpegColourPagesAreStoredAsYCbCrAndGreyOnesAsGrey) {
     WriteJob job;
     job.Describe(8, 32, 32, 5);
     job->outputSamplingCount = 3;
@@ -149,11 +145,7 @@ TEST(ScanlineWriter, JpegColourPagesAreStoredAsYCbCr) {
     job->outputHorizontalSampling[2] = job->outputVerticalSampling[2] = 1;
     std::vector<Bytes> rows(32, Bytes(96));
     for (uint32_t y = 0; y < 32; ++y)
-        for (uint32_t x = 0; x < 32; ++x) {
-            rows[y][3 * x] = static_cast<uint8_t>(x * 8);
-            rows[y][3 * x + 1] = static_cast<uint8_t>(y * 8);
-            rows[y][3 * x + 2] = 100;
-        }
+        for (uint32_t x = 0; x < 32; ++x) rows[y][3 * x] = x * 8, rows[y][3 * x + 1] = y * 8, rows[y][3 * x + 2] = 100;
     ASSERT_TRUE(job.WriteRows(rows));
     const Bytes tiff = job.Finish();
     PageReader page(tiff);
@@ -168,15 +160,10 @@ TEST(ScanlineWriter, JpegColourPagesAreStoredAsYCbCr) {
     for (uint32_t y = 0; y < 32; ++y)
         for (size_t i = 0; i < 96; ++i) worst = std::max(worst, std::abs(back[y][i] - rows[y][i]));
     EXPECT_LE(worst, 12) << "within JPEG's error";
-}
 
-TEST(ScanlineWriter, GreyJpegHasNoYCbCrTags) {
-    WriteJob job;
-    job.Describe(2, 16, 16, 5);
-    ASSERT_TRUE(job.WriteRows(PatternRows(16, 16)));
-    PageReader page(job.Finish());
-    EXPECT_EQ(page.U16(TIFFTAG_PHOTOMETRIC), 1u);
-    EXPECT_EQ(page.U16(TIFFTAG_COMPRESSION), static_cast<uint32_t>(COMPRESSION_JPEG));
+    PageReader grey(WritePage(2, 16, 16, 5));
+    EXPECT_EQ(grey.U16(TIFFTAG_PHOTOMETRIC), 1u);
+    EXPECT_EQ(grey.U16(TIFFTAG_COMPRESSION), static_cast<uint32_t>(COMPRESSION_JPEG));
 }
 
 TEST(ScanlineWriter, SixteenBitLinesReduceInPlace) {
@@ -187,12 +174,23 @@ TEST(ScanlineWriter, SixteenBitLinesReduceInPlace) {
     EXPECT_EQ(job->lineBytes, 4u);
     EXPECT_EQ(Bytes(line.begin(), line.begin() + 4), Bytes({1, 3, 5, 7}));
     EXPECT_EQ(DumpPage(job.Finish(), 0).data, Bytes({1, 3, 5, 7}));
-    WriteJob shortLine;
-    shortLine.Describe(2, 4, 1, 1, 16, 8);
-    Bytes half(4);
-    EXPECT_EQ(zanTIFFWriteNextScanLine(shortLine.host().ctx(), half.data(), 4), 0u)
-        << "a reduced line needs its 16-bit bytes";
-    EXPECT_EQ(shortLine.host().Errors(), std::vector<std::string>{"Incorrect line size."});
+}
+
+TEST(ScanlineWriter, ShortLineIsRefusedAndDoesNotAdvance) {
+    // A 16-bit line reduced to 8 bits needs its 16-bit bytes.
+    struct Case {
+        uint32_t colorSpace, width, bits, size, shortSize;
+    } cases[] = {{8, 10, 8, 30, 29}, {2, 4, 16, 8, 4}};
+    for (const Case& c : cases) {
+        WriteJob job;
+        job.Describe(c.colorSpace, c.width, 2, 1, c.bits, 8);
+        Bytes line(c.size);
+        EXPECT_EQ(zanTIFFWriteNextScanLine(job.host().ctx(), line.data(), c.shortSize), 0u) << c.bits;
+        ASSERT_EQ(zanTIFFWriteNextScanLine(job.host().ctx(), line.data(), c.size), c.size) << c.bits;
+        EXPECT_EQ(zanTIFFWriteNextScanLine(job.host().ctx(), line.data(), c.shortSize), 0u) << c.bits;
+        EXPECT_EQ(job->currentRow, 1u);
+        EXPECT_EQ(job.host().Errors(), std::vector<std::string>(2, "Incorrect line size."));
+    }
 }
 
 TEST(ScanlineWriter, CallerTagsWinOverDefaults) {
@@ -238,16 +236,6 @@ TEST(ScanlineWriter, RefusalsAndTheirMessages) {
     EXPECT_EQ(zanTIFFWriteNextScanLine(reading.host().ctx(), line.data(), 8), 0u);
     EXPECT_EQ(reading.host().Errors(), std::vector<std::string>{"Cannot write while reading."});
     reading->state = ZAN_STATE_IDLE;
-}
-
-TEST(ScanlineWriter, ShortLineDoesNotAdvance) {
-    WriteJob job;
-    job.Describe(8, 10, 2, 1);
-    Bytes line(30);
-    ASSERT_EQ(zanTIFFWriteNextScanLine(job.host().ctx(), line.data(), 30), 30u);
-    EXPECT_EQ(zanTIFFWriteNextScanLine(job.host().ctx(), line.data(), 29), 0u);
-    EXPECT_EQ(job->currentRow, 1u);
-    EXPECT_EQ(job.host().Errors(), std::vector<std::string>{"Incorrect line size."});
 }
 
 TEST(ScanlineWriter, TeardownFinishesThePageAsNextImageWould) {

@@ -89,7 +89,6 @@ public:
     TestHost& host() { return host_; }
     ConversionContext* operator->() { return host_.ctx(); }
     uint32_t size() const { return size_; }
-    void* block() const { return block_; }
 
 private:
     Dest dest_;
@@ -135,9 +134,18 @@ public:
         uint32_t v = 0;
         return TIFFGetField(tif_, tag, &v) ? v : 0xFFFFFFFFu;
     }
+    float F32(uint32_t tag) {
+        float v = 0;
+        return TIFFGetField(tif_, tag, &v) ? v : -1.0f;
+    }
     std::string Text(uint32_t tag) {
         char* v = nullptr;
         return TIFFGetField(tif_, tag, &v) && v ? v : "";
+    }
+    // Makes the page's EXIF directory current; false when it has none.
+    bool OpenExif() {
+        uint64_t offset = 0;
+        return TIFFGetField(tif_, TIFFTAG_EXIFIFD, &offset) && TIFFReadEXIFDirectory(tif_, offset);
     }
 
 private:

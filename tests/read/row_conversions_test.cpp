@@ -51,7 +51,8 @@ TEST(RowConversions, EdgesOfEachConversion) {
         // where it was read.
         const bool inPlace = !c.palette && !c.drop;
         Bytes read = c.read, line(c.line.size(), 0xEE);
-        read.resize(std::max(read.size(), line.size()));
+        // The reader's read buffer has room for every sample widened to a byte.
+        read.resize(std::max({read.size(), line.size(), size_t{c.width} * c.samples}));
         zan::ConvertScanLine(host.ctx(), read.data(), inPlace ? read.data() : line.data());
         if (inPlace) line.assign(read.begin(), read.begin() + static_cast<long>(line.size()));
         EXPECT_EQ(line, c.line);

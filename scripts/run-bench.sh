@@ -13,7 +13,7 @@ trap 'rm -f "$csv"' EXIT
 for program in "$build"/bin/bench_*; do
   [ -x "$program" ] || continue
   echo "run-bench: $(basename "$program")" >&2
-  "$program" --benchmark_format=csv --benchmark_repetitions=3 \
+  "$program" --benchmark_format=csv --benchmark_repetitions=5 \
       --benchmark_report_aggregates_only=true 2>/dev/null | grep '_median' >>"$csv" || true
 done
 
@@ -22,7 +22,7 @@ done
   echo
   echo "Recorded by \`make bench\` on $(date -u +%Y-%m-%d) — $(nproc) cores,"
   echo "$(grep -m1 'model name' /proc/cpuinfo | cut -d: -f2 | sed 's/^ *//'), $(uname -sr)."
-  echo "Median of 3 repetitions; ratio = reference time / module time (above 1: the module is faster)."
+  echo "Median of 5 repetitions; ratio = reference time / module time (above 1: the module is faster)."
   echo
   echo "| case | module (ms) | reference | reference (ms) | ratio |"
   echo "|---|---|---|---|---|"

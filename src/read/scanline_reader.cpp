@@ -199,7 +199,10 @@ uint32_t SetUpPage(ConversionContext* ctx) {
     const uint64_t pixels = width;
     if (photometric == PHOTOMETRIC_PALETTE) {
         if (bits != 2 && bits != 4 && bits != 8) return fail("Only supports 2 or 4 or 8 bit per sample palette tiff.");
-        if (!AllocateField(ctx, ctx->frameData, pixels * 3)) return fail(kMemoryError);
+        // The indices are the only sample of a palette page; a row of more
+        // samples would not fit the RGB work line it is read into.
+        if (samples != 1) return fail("Palette tiff with more than one sample per pixel not supported.");
+        if (!AllocateField(ctx, ctx->frameData, std::max<uint64_t>(pixels * 3, rowBytes))) return fail(kMemoryError);
         ++ctx->paletteExpansion;
         ctx->lineBytes = static_cast<uint32_t>(pixels * 3);
         if (!CopyPalette(ctx, tif)) return fail(nullptr);

@@ -244,6 +244,8 @@ TEST(ScanlineReaderStates, RefusalsAndTheEndOfThePage) {
 TEST(ScanlineReaderStates, PagesItCannotTakeAreRefusedWithTheirMessages) {
     PageSpec palette16 = Page(16, 8, 1, PHOTOMETRIC_PALETTE, 16);
     palette16.colorMap.assign(3 * 65536, 0);
+    PageSpec fourSamplePalette = Page(16, 8, 4, PHOTOMETRIC_PALETTE, 8);  // would overrun the RGB work line
+    fourSamplePalette.colorMap.assign(3 * 256, 0);
     struct Case {
         Bytes tiff;
         int pageNumber;
@@ -256,6 +258,7 @@ TEST(ScanlineReaderStates, PagesItCannotTakeAreRefusedWithTheirMessages) {
         {OnePage(Page(16, 8, 1, PHOTOMETRIC_MINISBLACK, 32)), 0, true,
          "Only supports 2, 4(palette), 2, 4, 8, 16 or 1 bitspersample."},
         {OnePage(palette16), 0, true, "Only supports 2 or 4 or 8 bit per sample palette tiff."},
+        {OnePage(fourSamplePalette), 0, false, "Palette tiff with more than one sample per pixel not supported."},
     };
     for (const Case& c : cases) {
         SCOPED_TRACE(c.message);

@@ -188,47 +188,35 @@ struct Entry {
     uint32_t value = 0;     // the value field as a number (an offset when byteSize > 4)
 };
 
-// An array of 32-bit numbers from the job's allocator.
-class NumberArray {
+// An array of `T` from the job's allocator, taken once by Allocate and
+// given back when the array goes.
+template <typename T>
+class HostArray {
 public:
-    explicit NumberArray(ConversionContext* ctx) : ctx_(ctx) {}
-    NumberArray(const NumberArray&) = delete;
-    NumberArray& operator=(const NumberArray&) = delete;
-    ~NumberArray() { ReleaseBlock(ctx_, data_); }
+    explicit HostArray(ConversionContext* ctx) : ctx_(ctx) {}
+    HostArray(const HostArray&) = delete;
+    HostArray& operator=(const HostArray&) = delete;
+    ~HostArray() { ReleaseBlock(ctx_, data_); }
     bool Allocate(uint32_t count) {
-        if (count > kMaxOffset / 4) return false;
-        data_ = static_cast<uint32_t*>(AllocateBlock(ctx_, count ? count * 4 : 4));
+        if (data_ || count > kMaxOffset / sizeof(T)) return false;
+        data_ = static_cast<T*>(AllocateBlock(ctx_, static_cast<uint32_t>((count ? count : 1) * sizeof(T))));
+        size_ = data_ ? count : 0;
         return data_ != nullptr;
     }
     bool present() const { return data_ != nullptr; }
-    uint32_t& operator[](uint32_t i) { return data_[i]; }
-    uint32_t operator[](uint32_t i) const { return data_[i]; }
-
-private:
-    ConversionContext* ctx_;
-    uint32_t* data_ = nullptr;
-};
-
-// A byte buffer from the job's allocator.
-class ByteBuffer {
-public:
-    explicit ByteBuffer(ConversionContext* ctx) : ctx_(ctx) {}
-    ByteBuffer(const ByteBuffer&) = delete;
-    ByteBuffer& operator=(const ByteBuffer&) = delete;
-    ~ByteBuffer() { ReleaseBlock(ctx_, data_); }
-    bool Allocate(uint32_t size) {
-        data_ = static_cast<unsigned char*>(AllocateBlock(ctx_, size));
-        size_ = data_ ? size : 0;
-        return data_ != nullptr;
-    }
-    unsigned char* data() const { return data_; }
+    T* data() const { return data_; }
     uint32_t size() const { return size_; }
+    T& operator[](uint32_t i) { return data_[i]; }
+    T operator[](uint32_t i) const { return data_[i]; }
 
 private:
     ConversionContext* ctx_;
-    unsigned char* data_ = nullptr;
+    T* data_ = nullptr;
     uint32_t size_ = 0;
 };
+
+using NumberArray = HostArray<uint32_t>;
+using ByteBuffer = HostArray<unsigned char>;
 
 class PageCopier {
 public:
@@ -304,7 +292,7 @@ private:
         // The numbers must be in the file before memory is taken for them.
         if (e.byteSize > 4 && uint64_t{e.value} + e.byteSize > sourceSize_)
             return Fail("Source value lies beyond the end of the file.");
-        if (!array.Allocate(stripCount_)) return Fail("Memory allocation error.");
+        if (!array.Allocate(e.count)) return Fail("Memory allocation error.");
         const uint32_t width = e.type == kShort ? 2 : 4;
         if (e.byteSize <= 4) {
             for (uint32_t i = 0; i < e.count && i < 4 / width; ++i)
@@ -402,11 +390,7 @@ private:
             compression_ = in_.Get16(e.raw + 8);
         } else if (e.tag == kBitsPerSample && e.type == kShort && e.count > 0) {
             NumberArray bits(ctx_);
-            const uint32_t saved = stripCount_;
-            stripCount_ = e.count;  // LoadStripNumbers sizes its array by the strip count
-            const bool loaded = LoadStripNumbers(e, bits, nullptr);
-            stripCount_ = saved;
-            if (!loaded) return false;
+            if (!LoadStripNumbers(e, bits, nullptr)) return false;
             bitsPerSample_ = bits[0];
             for (uint32_t i = 1; i < e.count; ++i)
                 if (bits[i] != bits[0]) mixedBits_ = true;

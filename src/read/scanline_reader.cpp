@@ -18,11 +18,20 @@
 #include "zantiff/zantiff.h"
 
 namespace zan {
+namespace {
+
+// Rows are read into the work line (frameData) when a conversion needs
+// room beyond the host's line, and straight into the host's line otherwise.
+bool UsesWorkLine(const ConversionContext* ctx) {
+    return ctx->paletteExpansion || ctx->dropSampleCount || ctx->reduceTo8Bits;
+}
+
+}  // namespace
 
 void ReleaseReaderBuffers(ConversionContext* ctx) {
     ReleaseField(ctx, ctx->stripBuffer);
     ctx->stripBufferSize = 0;
-    if (ctx->paletteExpansion || ctx->dropSampleCount || ctx->reduceTo8Bits) ReleaseField(ctx, ctx->frameData);
+    if (UsesWorkLine(ctx)) ReleaseField(ctx, ctx->frameData);
     ReleaseField(ctx, ctx->paletteRed);  // the three tables are one block
     ctx->paletteGreen = ctx->paletteBlue = nullptr;
 }
@@ -217,8 +226,9 @@ uint32_t SetUpPage(ConversionContext* ctx) {
     if (bits == 16) {
         // Anything but a wish for 16 bits delivers 8.
         ctx->reduceTo8Bits = ctx->outputBitsPerSample != 16;
-        if (extra == 0) {
-            if (ctx->reduceTo8Bits) ctx->lineBytes = ctx->scanlineSize / 2;
+        // 16-bit rows read into the host's line need no work line.
+        if (extra == 0 && ctx->reduceTo8Bits) {
+            ctx->lineBytes = ctx->scanlineSize / 2;
             if (!AllocateField(ctx, ctx->frameData, rowBytes)) return fail(kMemoryError);
         }
     }
@@ -296,8 +306,7 @@ uint32_t ReadNextRow(ConversionContext* ctx, uint8_t* line, uint32_t capacity) {
         zanError(ctx, "No more lines to read.");
         return 0;
     }
-    const bool work = ctx->paletteExpansion || ctx->dropSampleCount || ctx->reduceTo8Bits;
-    uint8_t* read = work ? static_cast<uint8_t*>(ctx->frameData) : line;
+    uint8_t* read = UsesWorkLine(ctx) ? static_cast<uint8_t*>(ctx->frameData) : line;
     const uint64_t errorsBefore = CodecErrorsDelivered();
     if (!ReadRow(ctx, read)) {
         // The codec explains its failures to the host's codec sink; when

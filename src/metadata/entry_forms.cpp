@@ -52,6 +52,11 @@ uint32_t PassedValueCount(const TIFFField* field, const MetadataEntry& e) {
     return element > 0 ? e.size / static_cast<uint32_t>(element) : 0;
 }
 
+int SetBlockEntry(TIFF* tif, const TIFFField* field, const MetadataEntry& e) {
+    if (TIFFFieldPassCount(field)) return TIFFSetField(tif, e.tag, PassedValueCount(field, e), e.value.block);
+    return TIFFSetField(tif, e.tag, e.value.block);
+}
+
 bool EntryFitsField(const TIFFField* field, const MetadataEntry& e) {
     if (!field) return false;
     if (TakesPointer(field)) return e.type == ZAN_METADATA_BLOCK && BlockFits(field, e);

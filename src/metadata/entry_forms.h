@@ -21,6 +21,10 @@ bool EntryFitsField(const TIFFField* field, const MetadataEntry& entry);
 // entries EntryFitsField accepted.
 uint32_t PassedValueCount(const TIFFField* field, const MetadataEntry& entry);
 
+// Passes a block entry that EntryFitsField accepted for `field`: with its
+// value count to a field that takes one, the block alone otherwise.
+int SetBlockEntry(TIFF* tif, const TIFFField* field, const MetadataEntry& entry);
+
 // True for the tags whose two values go as two arguments (PageNumber,
 // HalftoneHints, DotRange, YCbCrSubsampling).
 bool IsPairTag(uint32_t tag);

@@ -7,6 +7,7 @@
 
 #include "metadata/metadata_writer.h"
 
+#include "frame/report.h"
 #include "metadata/entry_forms.h"
 #include "osttiff/osttiff.h"
 #include "pivlo/pivlo.h"
@@ -23,11 +24,6 @@ const MetadataEntry* FirstExifEntry(const MetadataList* list) {
     return nullptr;
 }
 
-int Fail(ConversionContext* ctx, const char* message) {
-    zanError(ctx, message);
-    return 0;
-}
-
 // Passes one EXIF entry to the codec; a tag the codec refuses is simply
 // absent from the directory.
 void SetExifEntry(ConversionContext* ctx, TIFF* tif, const MetadataEntry& e) {
@@ -39,21 +35,17 @@ void SetExifEntry(ConversionContext* ctx, TIFF* tif, const MetadataEntry& e) {
     }
     // An entry whose form does not suit its tag's field is not passed: the
     // codec would read an argument of another kind.
-    if (!EntryFitsField(TIFFFindField(tif, e.tag, TIFF_ANY), e)) return;
+    const TIFFField* field = TIFFFindField(tif, e.tag, TIFF_ANY);
+    if (!EntryFitsField(field, e)) return;
     switch (e.type) {
-    case ZAN_METADATA_BLOCK: {
-        // The field's description decides the form: a count goes with the
-        // block only for a field that takes one (a fixed-size array such as
-        // LensSpecification takes the block alone, whatever the entry's count).
-        const TIFFField* field = TIFFFindField(tif, e.tag, TIFF_ANY);
+    case ZAN_METADATA_BLOCK:
+        // A fixed-length text is padded to its length (readers drop it
+        // otherwise); any other block goes as the field takes it.
         if (TIFFFieldDataType(field) == TIFF_ASCII && !TIFFFieldPassCount(field))
             TIFFSetAsciiFieldPivlo(tif, e.tag, static_cast<const char*>(e.value.block));
-        else if (TIFFFieldPassCount(field))
-            TIFFSetField(tif, e.tag, PassedValueCount(field, e), e.value.block);
         else
-            TIFFSetField(tif, e.tag, e.value.block);
+            SetBlockEntry(tif, field, e);
         break;
-    }
     case ZAN_METADATA_U8: TIFFSetField(tif, e.tag, static_cast<int>(e.value.u8)); break;
     case ZAN_METADATA_U16: TIFFSetField(tif, e.tag, static_cast<int>(e.value.u16[0])); break;
     case ZAN_METADATA_U32: TIFFSetField(tif, e.tag, e.value.u32); break;
@@ -75,12 +67,12 @@ int WriteTIFFMetadata(ConversionContext* ctx) {
     // of the current directory goes wrong once a directory was rewritten,
     // so the chain is counted.
     const tdir_t pages = TIFFNumberOfDirectories(tif);
-    if (pages == 0) return Fail(ctx, "Cannot set TIFF directory");
+    if (pages == 0) return ReportError(ctx, "Cannot set TIFF directory");
     const tdir_t page = pages - 1;
     zanBeginTiffEXIFDir(tif);
     if (!zanCreateTiffEXIFDir(tif)) {
         zanEndTiffEXIFDir(tif);
-        return Fail(ctx, "Cannot create EXIF entry in the TIFF directory");
+        return ReportError(ctx, "Cannot create EXIF entry in the TIFF directory");
     }
     for (const MetadataEntry* e = first; e; e = e->next)
         if (IsExif(e)) SetExifEntry(ctx, tif, *e);
@@ -98,11 +90,11 @@ int WriteTIFFMetadata(ConversionContext* ctx) {
     // Back to the page, whatever happened to the EXIF directory.
     const bool pageAgain = TIFFSetDirectory(tif, page) != 0;
     zanEndTiffEXIFDir(tif);
-    if (!written) return Fail(ctx, "TIFF EXIF write error");
-    if (!pageAgain) return Fail(ctx, "Cannot set TIFF directory");
+    if (!written) return ReportError(ctx, "TIFF EXIF write error");
+    if (!pageAgain) return ReportError(ctx, "Cannot set TIFF directory");
     if (!TIFFSetField(tif, TIFFTAG_EXIFIFD, TIFFLastEXIFOffsetPivlo(tif)))
-        return Fail(ctx, "Cannot create EXIF entry in the TIFF directory");
-    if (!TIFFRewriteDirectory(tif) || TIFFIOFailedPivlo(tif)) return Fail(ctx, "TIFF EXIF write error");
+        return ReportError(ctx, "Cannot create EXIF entry in the TIFF directory");
+    if (!TIFFRewriteDirectory(tif) || TIFFIOFailedPivlo(tif)) return ReportError(ctx, "TIFF EXIF write error");
     return 1;
 }
 

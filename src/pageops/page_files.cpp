@@ -18,11 +18,6 @@ bool PageFile::Measure() {
     return true;
 }
 
-int ReportError(ConversionContext* ctx, const char* message) {
-    zanError(ctx, message);
-    return 0;
-}
-
 bool SameFile(FILE* a, FILE* b) {
     if (a == b) return true;
 #if defined(_WIN32)

@@ -4,6 +4,7 @@
 #include <cstdint>
 #include <cstdio>
 
+#include "frame/report.h"
 #include "pageops/container_walker.h"
 #include "zantiff/conversion_context.h"
 
@@ -19,10 +20,6 @@ struct PageFile {
     // Learns the file's size; false when the stream cannot be positioned.
     bool Measure();
 };
-
-// Reports `message` through the host and returns 0, so a failure path can
-// end in one statement.
-int ReportError(ConversionContext* ctx, const char* message);
 
 // True when both streams are the same open file.
 bool SameFile(FILE* a, FILE* b);

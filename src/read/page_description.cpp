@@ -8,6 +8,7 @@
 
 #include "frame/codec_messages.h"
 #include "frame/host_memory.h"
+#include "frame/report.h"
 #include "frame/tiff_open.h"
 #include "metadata/metadata_reader.h"
 #include "osttiff/osttiff.h"
@@ -112,11 +113,6 @@ bool CopyIccProfile(ConversionContext* ctx, TIFF* tif) {
     return true;
 }
 
-int Fail(ConversionContext* ctx, const char* message) {
-    zanError(ctx, message);
-    return 0;
-}
-
 // Undoes the open of a failed zanTIFFGetInfo.
 int CloseFailedJob(ConversionContext* ctx) {
     RestoreCodecMessages(ctx);
@@ -165,24 +161,24 @@ int ReadImageDescription(ConversionContext* ctx, TIFF* tif) {
         !TIFFGetFieldDefaulted(tif, TIFFTAG_SAMPLESPERPIXEL, &samples) ||
         !TIFFGetFieldDefaulted(tif, TIFFTAG_PLANARCONFIG, &planar) ||
         !TIFFGetFieldDefaulted(tif, TIFFTAG_ORIENTATION, &orientation))
-        return Fail(ctx, kFieldError);
+        return ReportError(ctx, kFieldError);
     ctx->planarConfig = planar == PLANARCONFIG_CONTIG ? 1 : 2;
     ctx->orientation = orientation;
     TIFFGetField(tif, TIFFTAG_XRESOLUTION, &ctx->xResolution);
     TIFFGetField(tif, TIFFTAG_YRESOLUTION, &ctx->yResolution);
-    if (!TIFFGetFieldDefaulted(tif, TIFFTAG_RESOLUTIONUNIT, &unit)) return Fail(ctx, kFieldError);
+    if (!TIFFGetFieldDefaulted(tif, TIFFTAG_RESOLUTIONUNIT, &unit)) return ReportError(ctx, kFieldError);
     DescribeResolution(ctx, unit);
 
     uint16_t extraCount = 0;
     const uint16_t* extraValues = nullptr;
-    if (!GetStoredExtraSamples(ctx, tif, &extraCount, &extraValues)) return Fail(ctx, kFieldError);
+    if (!GetStoredExtraSamples(ctx, tif, &extraCount, &extraValues)) return ReportError(ctx, kFieldError);
     if (extraCount == 0) extraCount = SurplusSamples(samples, photometric);
     extraCount = std::min(extraCount, samples);  // a count beyond the samples is damage
     ctx->samplesPerPixel = samples;
     if (ctx->dropExtraSamples) ctx->samplesPerPixel = static_cast<uint16_t>(samples - extraCount);
     else ctx->extraSamples = extraCount;
 
-    if (!CopyIccProfile(ctx, tif)) return Fail(ctx, kMemoryError);
+    if (!CopyIccProfile(ctx, tif)) return ReportError(ctx, kMemoryError);
     ctx->imageHeight = length;
     ctx->imageWidth = width;
     ctx->bitsPerSample = bits;
@@ -197,11 +193,11 @@ int ReadImageDescription(ConversionContext* ctx, TIFF* tif) {
     ctx->fillOrder = TIFFGetField(tif, TIFFTAG_FILLORDER, &fillOrder) && fillOrder == FILLORDER_LSB2MSB ? 2 : 1;
     if (!CopyText(ctx, tif, TIFFTAG_DOCUMENTNAME, ctx->documentName) ||
         !CopyText(ctx, tif, TIFFTAG_IMAGEDESCRIPTION, ctx->imageDescription))
-        return Fail(ctx, kMemoryError);
+        return ReportError(ctx, kMemoryError);
     if (TIFFIsTiled(tif)) {
-        if (!TIFFGetField(tif, TIFFTAG_TILEWIDTH, &ctx->tileWidth)) return Fail(ctx, "Error getting tilewidth field.");
+        if (!TIFFGetField(tif, TIFFTAG_TILEWIDTH, &ctx->tileWidth)) return ReportError(ctx, "Error getting tilewidth field.");
         if (!TIFFGetField(tif, TIFFTAG_TILELENGTH, &ctx->tileHeight))
-            return Fail(ctx, "Error getting tileheight field.");
+            return ReportError(ctx, "Error getting tileheight field.");
     }
     return 1;
 }

@@ -6,6 +6,7 @@
 
 #include "frame/codec_messages.h"
 #include "frame/host_memory.h"
+#include "frame/report.h"
 #include "frame/tiff_open.h"
 #include "metadata/metadata_writer.h"
 #include "osttiff/osttiff.h"
@@ -16,11 +17,6 @@
 
 namespace zan {
 namespace {
-
-int Fail(ConversionContext* ctx, const char* message) {
-    zanError(ctx, message);
-    return 0;
-}
 
 // Closes what the call opened: the codec object first (closing may still
 // write, and what it reports still reaches the host), then the handlers
@@ -49,23 +45,11 @@ void SetPageTags(ConversionContext* ctx, TIFF* tif, const ColourLayout& layout) 
     TIFFSetField(tif, TIFFTAG_SOFTWARE, TIFFGetVersionLinePivlo());
     TIFFSetField(tif, TIFFTAG_FILLORDER, FILLORDER_MSB2LSB);
     const bool bilevel = ctx->colorSpace == ZAN_COLORSPACE_BILEVEL;
-    TIFFSetField(tif, TIFFTAG_BITSPERSAMPLE, layout.bitsPerSample);
-    TIFFSetField(tif, TIFFTAG_SAMPLESPERPIXEL, layout.samplesPerPixel);
-    TIFFSetField(tif, TIFFTAG_PHOTOMETRIC, layout.photometric);
+    SetColourTags(tif, layout);
     TIFFSetField(tif, TIFFTAG_COMPRESSION, bilevel ? COMPRESSION_CCITTFAX4 : COMPRESSION_PACKBITS);
-    if (layout.unassociatedAlpha) {
-        static const uint16_t kUnassociated[1] = {EXTRASAMPLE_UNASSALPHA};
-        TIFFSetField(tif, TIFFTAG_EXTRASAMPLES, 1, kUnassociated);
-    }
     if (bilevel && ctx->t6OptionsSet) TIFFSetField(tif, TIFFTAG_GROUP4OPTIONS, ctx->t6Options);
     SetResolution(ctx, tif);
     SetIccProfile(ctx, tif);
-}
-
-// Each 16-bit (little-endian) sample keeps its high byte; the rows are then
-// packed one after another at the start of the frame.
-void ReduceFrame(uint8_t* frame, uint64_t samples8) {
-    for (uint64_t i = 0; i < samples8; ++i) frame[i] = frame[2 * i + 1];
 }
 
 }  // namespace
@@ -77,11 +61,11 @@ extern "C" ZAN_API int zanFrameBufferToTIFF(ConversionContext* ctx) {
     const uint32_t space = ctx->colorSpace;
     if (space != ZAN_COLORSPACE_BILEVEL && space != ZAN_COLORSPACE_GREY && space != ZAN_COLORSPACE_GREY_ALPHA &&
         space != ZAN_COLORSPACE_RGB_ALPHA && space != ZAN_COLORSPACE_RGB)
-        return Fail(ctx, "Incompatible frame type");
+        return ReportError(ctx, "Incompatible frame type");
     if (ctx->outputBitsPerSample == 16 && ctx->bitsPerSample == 8)
-        return Fail(ctx, "Compressing from 8 to 16 bits image is not supported.");
+        return ReportError(ctx, "Compressing from 8 to 16 bits image is not supported.");
     if (ctx->outputBitsPerSample == 16 && ctx->bitsPerSample == 1)
-        return Fail(ctx, "Compressing from 1 to 16 bits image is not supported.");
+        return ReportError(ctx, "Compressing from 1 to 16 bits image is not supported.");
     const bool sixteen = ctx->bitsPerSample == 16 && ctx->outputBitsPerSample == 16;
     const bool reduce = ctx->bitsPerSample == 16 && !sixteen;
     ColourLayout layout;
@@ -89,17 +73,18 @@ extern "C" ZAN_API int zanFrameBufferToTIFF(ConversionContext* ctx) {
     // The frame must hold every row (twice the bytes when reduced from 16 bits).
     const uint64_t frameBytes = layout.rowBytes * ctx->frameHeight * (reduce ? 2 : 1);
     if (ctx->frameWidth == 0 || ctx->frameHeight == 0 || !ctx->frameData)
-        return Fail(ctx, "Image dimension can not be zero.");
+        return ReportError(ctx, "Image dimension can not be zero.");
     if (frameBytes > std::numeric_limits<uint32_t>::max() ||
         (ctx->frameBufferSize != 0 && ctx->frameBufferSize < frameBytes))
-        return Fail(ctx, "Frame buffer too small for the frame described.");
+        return ReportError(ctx, "Frame buffer too small for the frame described.");
 
     zanResetWorkBuffer(ctx);
     if (!OpenTIFFForWriting(ctx)) return 0;
     TIFF* tif = ctx->tiff;
     SetPageTags(ctx, tif, layout);
     auto* frame = static_cast<uint8_t*>(ctx->frameData);
-    if (reduce) ReduceFrame(frame, layout.rowBytes * ctx->frameHeight);
+    // The 8-bit rows end up packed one after another at the frame's start.
+    if (reduce) KeepHighBytes(frame, layout.rowBytes * ctx->frameHeight);
     const uint32_t rowsPerStrip = std::max<uint32_t>(1, TIFFDefaultStripSize(tif, 0xFFFFFFFFu));
     TIFFSetField(tif, TIFFTAG_ROWSPERSTRIP, rowsPerStrip);
     if (ctx->writeMetadataList) ApplyPageMetadata(ctx, tif);
@@ -117,7 +102,7 @@ extern "C" ZAN_API int zanFrameBufferToTIFF(ConversionContext* ctx) {
     CloseJob(ctx);
     if (failedWrite) {
         DiscardMemoryImage(ctx);
-        return Fail(ctx, "Unable to write the page to the destination.");
+        return ReportError(ctx, "Unable to write the page to the destination.");
     }
     HandOverResult(ctx);
     return 1;

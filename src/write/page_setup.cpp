@@ -17,13 +17,12 @@ namespace zan {
 namespace {
 
 // Tags the metadata does not overwrite when the page already holds them.
-constexpr std::array<uint32_t, 26> kGuardedTags = {
-    254, 263, 266, 269, 270, 271, 272, 280, 281, 282, 283, 285, 286,
-    287, 296, 305, 306, 315, 316, 321, 332, 333, 336, 337, 339, 33432};
+constexpr std::array<uint32_t, 28> kGuardedTags = {
+    254, 263, 266, 269, 270, 271, 272, 280, 281, 282, 283, 285, 286, 287,
+    296, 305, 306, 315, 316, 321, 332, 333, 336, 337, 339, 340, 341, 33432};
 
 bool IsGuarded(uint32_t tag) {
-    return std::find(kGuardedTags.begin(), kGuardedTags.end(), tag) != kGuardedTags.end() || tag == 340 ||
-           tag == 341;
+    return std::find(kGuardedTags.begin(), kGuardedTags.end(), tag) != kGuardedTags.end();
 }
 
 // Passes an entry to the codec in the form its type says; -1 for entries
@@ -40,8 +39,7 @@ int SetEntry(TIFF* tif, const MetadataEntry& e) {
     if (!EntryFitsField(field, e)) return 0;
     switch (e.type) {
     case ZAN_METADATA_BLOCK:
-        if (TIFFFieldPassCount(field)) return TIFFSetField(tif, e.tag, PassedValueCount(field, e), e.value.block);
-        return TIFFSetField(tif, e.tag, e.value.block);
+        return SetBlockEntry(tif, field, e);
     case ZAN_METADATA_U16:
         return TIFFSetField(tif, e.tag, static_cast<int>(e.value.u16[0]), static_cast<int>(e.value.u16[1]));
     case ZAN_METADATA_U32: return TIFFSetField(tif, e.tag, e.value.u32);

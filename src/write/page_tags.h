@@ -34,4 +34,10 @@ void SetResolution(ConversionContext* ctx, TIFF* tif);
 // The ICC profile, when the context has one.
 void SetIccProfile(ConversionContext* ctx, TIFF* tif);
 
+// Reduces `samples8` 16-bit (little-endian) samples to their high bytes in
+// place; the first `samples8` bytes then hold the 8-bit samples.
+inline void KeepHighBytes(uint8_t* samples, uint64_t samples8) {
+    for (uint64_t i = 0; i < samples8; ++i) samples[i] = samples[2 * i + 1];
+}
+
 }  // namespace zan

@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <limits>
 
+#include "frame/report.h"
 #include "frame/tiff_open.h"
 #include "osttiff/osttiff.h"
 #include "pivlo/pivlo.h"
@@ -14,11 +15,6 @@
 
 namespace zan {
 namespace {
-
-uint32_t Fail(ConversionContext* ctx, const char* message) {
-    zanError(ctx, message);
-    return 0;
-}
 
 // 16-bit samples go out as 8 unless 16 bits are asked for.
 bool ReducesTo8(const ConversionContext* ctx) {
@@ -85,23 +81,23 @@ void SetCompressionTags(ConversionContext* ctx, TIFF* tif) {
 // Checks the description and sets the page up (state 4). 0 after a
 // reported refusal, with the state as it was.
 uint32_t SetUpPage(ConversionContext* ctx) {
-    if (ctx->outputColorSpace < 1 || ctx->outputColorSpace > 8) return Fail(ctx, "Source colorspace not supported.");
-    if (ctx->imageWidth == 0 || ctx->imageHeight == 0) return Fail(ctx, "Image dimension can not be zero.");
+    if (ctx->outputColorSpace < 1 || ctx->outputColorSpace > 8) return ReportError(ctx, "Source colorspace not supported.");
+    if (ctx->imageWidth == 0 || ctx->imageHeight == 0) return ReportError(ctx, "Image dimension can not be zero.");
     if (ctx->outputCompression < 1 || ctx->outputCompression > 12)
-        return Fail(ctx, "Unrecognized or unset compression.");
+        return ReportError(ctx, "Unrecognized or unset compression.");
     if (ctx->outputColorSpace == ZAN_COLORSPACE_BILEVEL && ctx->outputCompression != ZAN_COMPRESSION_NONE &&
         ctx->outputCompression != ZAN_COMPRESSION_CCITT_G3 && ctx->outputCompression != ZAN_COMPRESSION_CCITT_G4)
-        return Fail(ctx, "G4 and no compression is the only compression method supported for BW.");
+        return ReportError(ctx, "G4 and no compression is the only compression method supported for BW.");
     if (!OpenTIFFForWriting(ctx)) return 0;
     if (ctx->outputBitsPerSample == 16 && ctx->bitsPerSample == 8)
-        return Fail(ctx, "Compressing from 8 to 16 bits image is not supported.");
+        return ReportError(ctx, "Compressing from 8 to 16 bits image is not supported.");
     if (ctx->outputBitsPerSample == 16 && ctx->bitsPerSample == 1)
-        return Fail(ctx, "Compressing from 1 to 16 bits image is not supported.");
+        return ReportError(ctx, "Compressing from 1 to 16 bits image is not supported.");
     ColourLayout layout;
     ColourLayoutFor(ctx->outputColorSpace, ctx->imageWidth, Writes16(ctx), ctx->whiteIsZero != 0,
                     ctx->componentCount, &layout);
     if (layout.rowBytes == 0 || layout.rowBytes > std::numeric_limits<uint32_t>::max() / 2)
-        return Fail(ctx, "Image dimension can not be zero.");
+        return ReportError(ctx, "Image dimension can not be zero.");
 
     TIFF* tif = ctx->tiff;
     TIFFSetField(tif, TIFFTAG_IMAGEWIDTH, ctx->imageWidth);
@@ -127,26 +123,20 @@ uint32_t SetUpPage(ConversionContext* ctx) {
     return 1;
 }
 
-// Each 16-bit (little-endian) sample of the line keeps its high byte; the
-// line's first half then holds the 8-bit samples.
-void ReduceLine(uint8_t* line, uint32_t samples8) {
-    for (uint32_t i = 0; i < samples8; ++i) line[i] = line[2 * i + 1];
-}
-
 }  // namespace
 }  // namespace zan
 
 extern "C" ZAN_API uint32_t zanTIFFWriteNextScanLine(ConversionContext* ctx, void* line, uint32_t lineSize) {
     using namespace zan;
     if (!ctx) return 0;
-    if (ctx->state == ZAN_STATE_READING) return Fail(ctx, "Cannot write while reading.");
+    if (ctx->state == ZAN_STATE_READING) return ReportError(ctx, "Cannot write while reading.");
     if ((ctx->state == ZAN_STATE_IDLE || ctx->state == ZAN_STATE_PAGE_CLOSED) && !SetUpPage(ctx)) return 0;
-    if (!ctx->tiff) return Fail(ctx, "Unable to create TIFF object");
+    if (!ctx->tiff) return ReportError(ctx, "Unable to create TIFF object");
     // A line that is reduced from 16 bits holds two bytes for every byte written.
     const uint64_t needed = uint64_t{ctx->lineBytes} * (ReducesTo8(ctx) ? 2 : 1);
-    if (!line || lineSize < needed) return Fail(ctx, "Incorrect line size.");
+    if (!line || lineSize < needed) return ReportError(ctx, "Incorrect line size.");
     auto* bytes = static_cast<uint8_t*>(line);
-    if (ReducesTo8(ctx)) ReduceLine(bytes, ctx->lineBytes);
+    if (ReducesTo8(ctx)) KeepHighBytes(bytes, ctx->lineBytes);
     if (TIFFWriteScanline(ctx->tiff, bytes, ctx->currentRow, 0) == -1) return 0;
     ++ctx->currentRow;
     return lineSize;

@@ -1,8 +1,8 @@
-// Writes the benchmark inputs with libtiff:
-//   make_inputs multipage OUT.tif   200 pages of 512x512 8-bit grey, LZW
-//   make_inputs large OUT.tif       one 8192x8192 8-bit RGB page, uncompressed (~200 MB)
-//   make_inputs sample OUT.tif      the demo's 3-page file: RGB (LZW), palette, 16-bit grey
-//   make_inputs rgb W H OUT.tif     one W x H 8-bit RGB page, uncompressed
+// Writes the benchmark inputs with libtiff (any other call is refused):
+//   make_bench_inputs multipage OUT.tif   200 pages of 512x512 8-bit grey, LZW
+//   make_bench_inputs large OUT.tif       one 8192x8192 8-bit RGB page, uncompressed (~200 MB)
+//   make_bench_inputs sample OUT.tif      the demo's 3-page file: RGB (LZW), palette, 16-bit grey
+//   make_bench_inputs rgb W H OUT.tif     one W x H 8-bit RGB page, uncompressed
 
 #include <cstdio>
 #include <cstdlib>
@@ -78,11 +78,15 @@ bool WriteGrey16Page(TIFF* tif, uint32_t width, uint32_t height) {
 }  // namespace
 
 int main(int argc, char** argv) {
-    if (argc < 3) {
-        std::fprintf(stderr, "usage: make_inputs multipage|large|sample OUT.tif | rgb W H OUT.tif\n");
+    const std::string kind = argc > 1 ? argv[1] : "";
+    const bool known = ((kind == "multipage" || kind == "large" || kind == "sample") && argc == 3) ||
+                       (kind == "rgb" && argc == 5);
+    // Anything else is refused before a file is created: a mistyped call must
+    // not leave a 200 MB page under an unexpected name.
+    if (!known) {
+        std::fprintf(stderr, "usage: make_bench_inputs multipage|large|sample OUT.tif | rgb W H OUT.tif\n");
         return 2;
     }
-    const std::string kind = argv[1];
     TIFF* tif = TIFFOpen(argv[argc - 1], "w");
     if (!tif) return 1;
     bool ok = true;
@@ -91,7 +95,7 @@ int main(int argc, char** argv) {
     } else if (kind == "sample") {
         ok = WritePage(tif, 160, 120, 3, COMPRESSION_LZW, 0) && WritePalettePage(tif, 160, 120) &&
              WriteGrey16Page(tif, 160, 120);
-    } else if (kind == "rgb" && argc == 5) {
+    } else if (kind == "rgb") {
         ok = WritePage(tif, static_cast<uint32_t>(std::atoi(argv[2])), static_cast<uint32_t>(std::atoi(argv[3])), 3,
                        COMPRESSION_NONE, 0);
     } else {

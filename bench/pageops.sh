@@ -12,8 +12,8 @@ tool="$build/bin/zantiff"
 work=$(mktemp -d)
 trap 'rm -rf "$work"' EXIT
 
-"$build/bin/bench_make_inputs" multipage "$work/multi.tif"
-"$build/bin/bench_make_inputs" large "$work/large.tif"
+"$build/bin/make_bench_inputs" multipage "$work/multi.tif"
+"$build/bin/make_bench_inputs" large "$work/large.tif"
 printf 'II*\0\0\0\0\0' >"$work/empty.tif"   # a TIFF without pages to append to
 
 # measure PREPARE COMMAND...: runs PREPARE, then COMMAND, RUNS times; prints

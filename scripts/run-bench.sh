@@ -12,6 +12,8 @@ trap 'rm -f "$csv"' EXIT
 
 for program in "$build"/bin/bench_*; do
   [ -x "$program" ] || continue
+  # Only Google Benchmark programs: they list their cases when asked.
+  "$program" --benchmark_list_tests >/dev/null 2>&1 || continue
   echo "run-bench: $(basename "$program")" >&2
   "$program" --benchmark_format=csv --benchmark_repetitions=5 \
       --benchmark_report_aggregates_only=true 2>/dev/null | grep '_median' >>"$csv" || true

@@ -23,6 +23,13 @@ struct Adapter {
     int exifDepth = 0;             // open EXIF brackets
     tdir_t exifBaseDirectory = 0;  // image directory the outer bracket began on
     uint64_t lastExifOffset = 0;   // EXIF directory written last
+    uint64_t lastPageOffset = 0;   // page directory written last by TIFFWritePageDirectoryPivlo
+    // ExtraSamples that libtiff completed while reading a directory (it
+    // warns, then counts surplus samples as extra ones): the directory and
+    // the count it stores itself.
+    uint64_t completedExtraDirectory = 0;
+    uint16_t storedExtraCount = 0;
+    bool extraCompleted = false;
 };
 
 // The adapter of a codec object opened by TIFFClientOpenPivlo; null for any

@@ -129,6 +129,26 @@ void UnmapThunk(thandle_t h, void* base, toff_t size) {
     if (a->unmap) a->unmap(a->client, base, static_cast<uint32_t>(size));
 }
 
+// Watches the object's warnings for the one libtiff gives when it completes
+// a directory's ExtraSamples, and notes what the directory itself stores,
+// so that the stored count is known without reading the directory again
+// (a stream source cannot go back to it). The warning still reaches the
+// process-wide handlers.
+int WarningWatch(TIFF* tif, void* user, const char* module, const char* format, va_list) {
+    static const char kCompleted[] = "Sum of Photometric type-related color channels";
+    auto* a = static_cast<Adapter*>(user);
+    if (tif && a && format && module && std::strcmp(module, "TIFFReadDirectory") == 0 &&
+        std::strncmp(format, kCompleted, sizeof kCompleted - 1) == 0) {
+        uint16_t count = 0;
+        uint16_t* values = nullptr;
+        if (!TIFFGetField(tif, TIFFTAG_EXTRASAMPLES, &count, &values)) count = 0;
+        a->completedExtraDirectory = TIFFCurrentDirOffset(tif);
+        a->storedExtraCount = count;
+        a->extraCompleted = true;
+    }
+    return 0;
+}
+
 
 }  // namespace
 
@@ -157,8 +177,13 @@ TIFF* TIFFClientOpenPivloExt(const char* name, const char* mode, void* clientDat
     }
     auto* a = new (block) Adapter{clientData, readProc, writeProc, seekProc, closeProc, sizeProc,
                                   mapProc, unmapProc, allocProc, reallocProc, freeProc};
+    // Without options of the caller's, the object's warnings are watched
+    // (see WarningWatch).
+    TIFFOpenOptions* own = options ? nullptr : TIFFOpenOptionsAlloc();
+    if (own) TIFFOpenOptionsSetWarningHandlerExtR(own, WarningWatch, a);
     TIFF* tif = TIFFClientOpenExt(name ? name : "", mode, a, ReadThunk, WriteThunk, SeekThunk,
-                                  CloseThunk, SizeThunk, MapThunk, UnmapThunk, options);
+                                  CloseThunk, SizeThunk, MapThunk, UnmapThunk, options ? options : own);
+    if (own) TIFFOpenOptionsFree(own);
     // libtiff does not call the close procedure when the open fails.
     if (!tif) ReleaseWith(freeProc, a);
     return tif;

@@ -1,4 +1,5 @@
-// Field descriptions, directories as stored, and the EXIF bracket.
+// Field descriptions, directories as stored, the pages and EXIF directories
+// written.
 
 #include <algorithm>
 #include <cstring>
@@ -9,52 +10,70 @@
 
 namespace {
 
-uint16_t Get16(const unsigned char* b, bool swapped) {
-    return swapped ? static_cast<uint16_t>(b[0] << 8 | b[1]) : static_cast<uint16_t>(b[1] << 8 | b[0]);
-}
-
-uint64_t GetN(const unsigned char* b, int n, bool swapped) {
+// Numbers of the file's byte order.
+uint64_t GetNumber(TIFF* tif, const unsigned char* b, int n) {
     uint64_t v = 0;
-    for (int i = 0; i < n; ++i) v |= uint64_t{b[swapped ? i : n - 1 - i]} << (8 * (n - 1 - i));
+    for (int i = 0; i < n; ++i) {
+        const unsigned char byte = TIFFIsBigEndian(tif) ? b[i] : b[n - 1 - i];
+        v = v << 8 | byte;
+    }
     return v;
 }
 
-// Reads n bytes at `offset` through the object's own client procedures.
+void PutNumber(TIFF* tif, uint64_t v, unsigned char* b, int n) {
+    for (int i = 0; i < n; ++i) {
+        const auto byte = static_cast<unsigned char>(v >> (8 * i));
+        b[TIFFIsBigEndian(tif) ? n - 1 - i : i] = byte;
+    }
+}
+
+// Reads or writes n bytes at `offset` through the object's own client
+// procedures.
 bool ReadClient(TIFF* tif, uint64_t offset, void* buffer, tmsize_t n) {
     const thandle_t handle = TIFFClientdata(tif);
     if (TIFFGetSeekProc(tif)(handle, offset, SEEK_SET) != offset) return false;
     return TIFFGetReadProc(tif)(handle, buffer, n) == n;
 }
 
-// Finds `tag` among the entries of the directory at `offset`. The entry's
-// type, count and value field are returned when found. -1 when the entries
-// cannot be read.
-struct StoredEntry {
-    uint16_t type = 0;
-    uint64_t count = 0;
-    unsigned char value[8] = {0};
-};
+bool WriteClient(TIFF* tif, uint64_t offset, void* buffer, tmsize_t n) {
+    const thandle_t handle = TIFFClientdata(tif);
+    if (TIFFGetSeekProc(tif)(handle, offset, SEEK_SET) != offset) return false;
+    return TIFFGetWriteProc(tif)(handle, buffer, n) == n;
+}
 
-int FindStoredEntry(TIFF* tif, uint64_t offset, uint32_t tag, StoredEntry* found) {
-    const bool big = TIFFIsBigTIFF(tif);
-    const bool swapped = TIFFIsByteSwapped(tif) != 0;
-    const int countSize = big ? 8 : 2, entrySize = big ? 20 : 12, fieldSize = big ? 8 : 4;
-    unsigned char head[8];
-    if (!ReadClient(tif, offset, head, countSize)) return -1;
-    const uint64_t entries = GetN(head, countSize, swapped);
-    if (entries > 0xFFFF) return -1;  // larger than libtiff reads itself
-    std::vector<unsigned char> table(static_cast<size_t>(entries) * entrySize);
-    if (!table.empty() && !ReadClient(tif, offset + countSize, table.data(), static_cast<tmsize_t>(table.size())))
-        return -1;
-    for (uint64_t i = 0; i < entries; ++i) {
-        const unsigned char* e = table.data() + i * entrySize;
-        if (Get16(e, swapped) != tag) continue;
-        found->type = Get16(e + 2, swapped);
-        found->count = GetN(e + 4, fieldSize, swapped);
-        std::memcpy(found->value, e + 4 + fieldSize, static_cast<size_t>(fieldSize));
-        return 1;
+// The classic directory at `offset`: its entry count and the offset of its
+// next-directory field.
+bool ReadDirectoryHead(TIFF* tif, uint64_t offset, uint16_t* count, uint64_t* linkField) {
+    unsigned char bytes[2];
+    if (offset == 0 || !ReadClient(tif, offset, bytes, 2)) return false;
+    *count = static_cast<uint16_t>(GetNumber(tif, bytes, 2));
+    *linkField = offset + 2 + 12u * uint64_t{*count};
+    return true;
+}
+
+// The value of a 4-byte offset field (the header's first-directory field, or
+// a directory's next-directory field).
+bool ReadLink(TIFF* tif, uint64_t field, uint64_t* value) {
+    unsigned char bytes[4];
+    if (!ReadClient(tif, field, bytes, 4)) return false;
+    *value = GetNumber(tif, bytes, 4);
+    return true;
+}
+
+// The offset of the field that links the directory written next into the
+// chain: the last directory's next-directory field, or the header's. Walks
+// the chain once, stopping at libtiff's own limit of directories.
+bool ChainEndField(TIFF* tif, uint64_t* field) {
+    constexpr uint32_t kMostDirectories = 1u << 20;
+    *field = 4;
+    uint64_t next = 0;
+    if (!ReadLink(tif, 4, &next)) return false;
+    for (uint32_t steps = 0; next != 0; ++steps) {
+        uint16_t count = 0;
+        if (steps == kMostDirectories || !ReadDirectoryHead(tif, next, &count, field) || !ReadLink(tif, *field, &next))
+            return false;
     }
-    return 0;
+    return true;
 }
 
 }  // namespace
@@ -74,22 +93,17 @@ int TIFFFieldInfoPivlo(TIFF* tif, uint32_t tag, TIFFFieldInfo* info) {
     return 1;
 }
 
-int TIFFDirectoryHasTagPivlo(TIFF* tif, uint32_t tag) {
-    StoredEntry entry;
-    return FindStoredEntry(tif, TIFFCurrentDirOffset(tif), tag, &entry);
-}
-
 int TIFFGetStoredExtraSamplesPivlo(TIFF* tif, uint16_t* count, const uint16_t** values) {
     static const uint16_t kNone[1] = {0};
-    const int stored = TIFFDirectoryHasTagPivlo(tif, TIFFTAG_EXTRASAMPLES);
-    if (stored == 0) {
-        *count = 0;
-        *values = kNone;
-        return 1;
-    }
     uint16_t* libtiffValues = nullptr;
     if (!TIFFGetFieldDefaulted(tif, TIFFTAG_EXTRASAMPLES, count, &libtiffValues)) return 0;
     *values = libtiffValues ? libtiffValues : kNone;
+    // libtiff appends what it completed behind the values the directory
+    // stores, so the stored ones are the first.
+    const osttiff::Adapter* a = osttiff::AdapterOfTiff(tif);
+    if (a && a->extraCompleted && a->completedExtraDirectory == TIFFCurrentDirOffset(tif))
+        *count = std::min(*count, a->storedExtraCount);
+    if (*count == 0) *values = kNone;
     return 1;
 }
 
@@ -141,6 +155,53 @@ int TIFFWriteEXIFDirectoryPivlo(TIFF* tif) {
 uint64_t TIFFLastEXIFOffsetPivlo(TIFF* tif) {
     osttiff::Adapter* a = osttiff::AdapterOfTiff(tif);
     return a ? a->lastExifOffset : 0;
+}
+
+int TIFFWritePageDirectoryPivlo(TIFF* tif) {
+    osttiff::Adapter* a = osttiff::AdapterOfTiff(tif);
+    if (!a || TIFFIsBigTIFF(tif)) return TIFFWriteDirectory(tif);
+    // The page is linked from the field found here: the directory written
+    // last by this object (known), or the end of the chain (walked once).
+    uint64_t linkField = 0;
+    uint16_t count = 0;
+    const bool found = a->lastPageOffset ? ReadDirectoryHead(tif, a->lastPageOffset, &count, &linkField)
+                                         : ChainEndField(tif, &linkField);
+    a->lastPageOffset = 0;
+    if (!TIFFWriteDirectory(tif)) return 0;
+    uint64_t page = 0;
+    if (found && ReadLink(tif, linkField, &page)) a->lastPageOffset = page;
+    return 1;
+}
+
+uint64_t TIFFLastPageOffsetPivlo(TIFF* tif) {
+    osttiff::Adapter* a = osttiff::AdapterOfTiff(tif);
+    return a ? a->lastPageOffset : 0;
+}
+
+int TIFFSetLastPageEXIFPivlo(TIFF* tif, uint64_t exifOffset) {
+    const uint64_t page = TIFFLastPageOffsetPivlo(tif);
+    uint16_t count = 0;
+    uint64_t linkField = 0;
+    if (page == 0 || exifOffset > 0xFFFFFFFFu || !ReadDirectoryHead(tif, page, &count, &linkField)) return 0;
+    std::vector<unsigned char> entries(12u * count + 4u);
+    if (!ReadClient(tif, page + 2, entries.data(), static_cast<tmsize_t>(entries.size()))) return 0;
+    for (uint16_t i = 0; i < count; ++i) {
+        unsigned char* entry = entries.data() + 12u * i;
+        if (GetNumber(tif, entry, 2) != TIFFTAG_EXIFIFD) continue;
+        if (exifOffset != 0) {
+            PutNumber(tif, exifOffset, entry + 8, 4);
+            return WriteClient(tif, page + 2 + 12u * i + 8, entry + 8, 4);
+        }
+        // The entry goes; the directory keeps its place (later links reach
+        // it there) and ends 12 bytes earlier.
+        std::memmove(entry, entry + 12, entries.size() - 12u * (i + 1u));
+        entries.resize(entries.size() - 12);
+        unsigned char head[2];
+        PutNumber(tif, count - 1u, head, 2);
+        return WriteClient(tif, page, head, 2) &&
+               WriteClient(tif, page + 2, entries.data(), static_cast<tmsize_t>(entries.size()));
+    }
+    return 0;
 }
 
 int TIFFFieldIsSetPivlo(TIFF* tif, uint32_t tag) {

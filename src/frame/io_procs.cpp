@@ -9,10 +9,6 @@
 #include <cstdio>
 #include <limits>
 
-#if !defined(_WIN32)
-#include <sys/mman.h>
-#endif
-
 #include "pivlo/pivlo.h"
 
 namespace zan {
@@ -89,32 +85,6 @@ uint32_t FileSizeProc(void* client) {
                : static_cast<uint32_t>(size);
 }
 
-#if !defined(_WIN32)
-int FileMapProc(void* client, void** base, uint32_t* size) {
-    FileHandleRecord* file = FileOf(client);
-    if (!file || !file->stream) return 0;
-    const int64_t end = StreamSize(file->stream);
-    if (end <= static_cast<int64_t>(file->baseOffset)) return 0;
-    const int64_t length = end - file->baseOffset;
-    if (length >= static_cast<int64_t>(std::numeric_limits<uint32_t>::max())) return 0;
-    // Mapped from the start of the file (offsets must be page-aligned); the
-    // codec sees the part from the base offset on.
-    void* map = mmap(nullptr, static_cast<size_t>(end), PROT_READ, MAP_PRIVATE, fileno(file->stream), 0);
-    if (map == MAP_FAILED) return 0;
-    *base = static_cast<unsigned char*>(map) + file->baseOffset;
-    *size = static_cast<uint32_t>(length);
-    return 1;
-}
-
-void FileUnmapProc(void* client, void* base, uint32_t size) {
-    FileHandleRecord* file = FileOf(client);
-    if (!file || !base) return;
-    munmap(static_cast<unsigned char*>(base) - file->baseOffset, uint64_t{file->baseOffset} + size);
-}
-#else
-int FileMapProc(void*, void**, uint32_t*) { return 0; }
-void FileUnmapProc(void*, void*, uint32_t) {}
-#endif
 
 // ---- host callbacks ----
 
@@ -187,8 +157,10 @@ int StreamMapProc(void*, void**, uint32_t* size) {
 
 // ---- procedure sets ----
 
+// Host files are read through their streams, never mapped: a file that the
+// host truncates while the job runs gives a read error, not a fault.
 ClientProcs FileSourceProcs() {
-    return {FileReadProc, NullProc, FileSeekProc, NullProc, FileSizeProc, FileMapProc, FileUnmapProc};
+    return {FileReadProc, NullProc, FileSeekProc, NullProc, FileSizeProc, nullptr, nullptr};
 }
 
 ClientProcs MemorySourceProcs() {

@@ -43,11 +43,6 @@ int32_t FileReadProc(void* client, void* buffer, int32_t byteCount);
 int32_t FileWriteProc(void* client, void* buffer, int32_t byteCount);
 uint32_t FileSeekProc(void* client, uint32_t offset, int whence);
 uint32_t FileSizeProc(void* client);
-// A file source is mapped into memory for the codec where the system allows
-// (read-only, from the base offset on, when it fits in 32 bits); otherwise
-// it answers "not mapped" and the codec reads through FileReadProc.
-int FileMapProc(void* client, void** base, uint32_t* size);
-void FileUnmapProc(void* client, void* base, uint32_t size);
 
 // The memory image: a memory source, or the growing destination block.
 int32_t MemReadProc(void* client, void* buffer, int32_t byteCount);

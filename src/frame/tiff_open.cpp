@@ -8,9 +8,9 @@
 #include "frame/codec_messages.h"
 #include "frame/host_memory.h"
 #include "frame/io_procs.h"
+#include "frame/tiff_extent.h"
 #include "osttiff/osttiff.h"
 #include "pivlo/pivlo.h"
-#include "metadata/metadata_writer.h"
 #include "read/reader_buffers.h"
 #include "write/page_setup.h"
 #include "zantiff/zantiff.h"
@@ -171,6 +171,14 @@ int OpenTIFFForWriting(ConversionContext* ctx) {
         procs = CallbackDestProcs(ctx);
         break;
     case ZAN_DEST_FIXED_BUFFER:
+        // Pages are added behind the TIFF the buffer holds: the codec finds
+        // the end of the data as the buffer's high-water mark.
+        if (ctx->appendPages == 1) {
+            uint32_t extent = 0;
+            if (!FindTiffExtent(static_cast<const uint8_t*>(ctx->destMemory), ctx->destMemoryCapacity, &extent))
+                return FailWriting(ctx, "The destination buffer holds no TIFF to add a page to.");
+            ctx->memSize = extent;
+        }
         ctx->destMemPos = static_cast<unsigned char*>(ctx->destMemory);
         if (ctx->destSizeOut) *ctx->destSizeOut = 0;
         procs = FixedBufferDestProcs();
@@ -207,7 +215,7 @@ extern "C" ZAN_API void zanDestroyTIFF(ConversionContext* ctx) {
     if (!ctx) return;
     if (ctx->state == ZAN_STATE_WRITING && ctx->tiff) {
         // The page in progress is finished as zanTIFFNextImage would.
-        if (WritePageDirectory(ctx) && ctx->writeMetadataList) WriteTIFFMetadata(ctx);
+        FinishPage(ctx);
     } else if (ctx->state == ZAN_STATE_READING) {
         // The strip buffer, work line and palette copy of the scanline reader.
         ReleaseReaderBuffers(ctx);

@@ -22,6 +22,7 @@ bool IsRealType(TIFFDataType type) {
 // The codec takes the field's value through a pointer (a text, an array,
 // a counted block) rather than as a number.
 bool TakesPointer(const TIFFField* field) {
+    if (IsOneValueForAllSamples(TIFFFieldTag(field))) return false;
     const int count = TIFFFieldWriteCount(field);
     return TIFFFieldDataType(field) == TIFF_ASCII || TIFFFieldPassCount(field) || count == TIFF_VARIABLE ||
            count == TIFF_VARIABLE2 || count == TIFF_SPP || (count > 1 && !IsPairTag(TIFFFieldTag(field)));
@@ -40,6 +41,11 @@ bool BlockFits(const TIFFField* field, const MetadataEntry& e) {
 }
 
 }  // namespace
+
+bool IsOneValueForAllSamples(uint32_t tag) {
+    return tag == TIFFTAG_MINSAMPLEVALUE || tag == TIFFTAG_MAXSAMPLEVALUE || tag == TIFFTAG_SAMPLEFORMAT ||
+           tag == TIFFTAG_SMINSAMPLEVALUE || tag == TIFFTAG_SMAXSAMPLEVALUE || tag == TIFFTAG_DATATYPE;
+}
 
 bool IsPairTag(uint32_t tag) {
     return tag == TIFFTAG_PAGENUMBER || tag == TIFFTAG_HALFTONEHINTS || tag == TIFFTAG_DOTRANGE ||
@@ -60,7 +66,11 @@ int SetBlockEntry(TIFF* tif, const TIFFField* field, const MetadataEntry& e) {
 bool EntryFitsField(const TIFFField* field, const MetadataEntry& e) {
     if (!field) return false;
     if (TakesPointer(field)) return e.type == ZAN_METADATA_BLOCK && BlockFits(field, e);
-    const TIFFDataType type = TIFFFieldDataType(field);
+    // SMinSampleValue and SMaxSampleValue take a double whatever type the
+    // file stores them in.
+    const TIFFDataType type = TIFFFieldSetGetSize(field) == 8 && IsOneValueForAllSamples(TIFFFieldTag(field))
+                                  ? TIFF_DOUBLE
+                                  : TIFFFieldDataType(field);
     switch (e.type) {
     case ZAN_METADATA_U8: case ZAN_METADATA_U16: case ZAN_METADATA_U32: return IsIntegerType(type);
     case ZAN_METADATA_F32: case ZAN_METADATA_F64: return IsRealType(type);

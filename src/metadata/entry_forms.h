@@ -29,4 +29,10 @@ int SetBlockEntry(TIFF* tif, const TIFFField* field, const MetadataEntry& entry)
 // HalftoneHints, DotRange, YCbCrSubsampling).
 bool IsPairTag(uint32_t tag);
 
+// True for the per-sample fields libtiff takes as one value that it applies
+// to every sample (MinSampleValue, MaxSampleValue, SampleFormat,
+// SMinSampleValue, SMaxSampleValue, DataType), although their count is
+// variable.
+bool IsOneValueForAllSamples(uint32_t tag);
+
 }  // namespace zan

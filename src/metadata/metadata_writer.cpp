@@ -1,9 +1,10 @@
 // The EXIF directory of a written page. The page's directory has already
-// been written when this runs, so the EXIF directory is written on its own
-// at the end of the file, the page is made current again, and its directory
-// is rewritten with the ExifIFD link (the sequence libtiff 4.5 handles for
-// every page of a multi-page file; the page's first directory becomes
-// unused space).
+// been written, with an ExifIFD entry of 0 as a placeholder, when this runs:
+// the EXIF directory is written on its own at the end of the file and the
+// placeholder is set to it in place. Nothing walks the chain of pages, so
+// writing many pages with EXIF costs the same for every page, and the codec
+// never goes back to a written page (whose directory the next page's set-up
+// would otherwise rewrite).
 
 #include "metadata/metadata_writer.h"
 
@@ -57,44 +58,36 @@ void SetExifEntry(ConversionContext* ctx, TIFF* tif, const MetadataEntry& e) {
 
 }  // namespace
 
+bool HasExifEntries(const ConversionContext* ctx) {
+    return ctx->writeMetadataList && FirstExifEntry(ctx->writeMetadataList);
+}
+
 int WriteTIFFMetadata(ConversionContext* ctx) {
     TIFF* tif = ctx->tiff;
-    const MetadataList* list = ctx->writeMetadataList;
-    if (!tif || !list) return 1;
-    const MetadataEntry* first = FirstExifEntry(list);
-    if (!first) return 1;
-    // The page just written is the last of the chain. libtiff's own count
-    // of the current directory goes wrong once a directory was rewritten,
-    // so the chain is counted.
-    const tdir_t pages = TIFFNumberOfDirectories(tif);
-    if (pages == 0) return ReportError(ctx, "Cannot set TIFF directory");
-    const tdir_t page = pages - 1;
+    if (!tif || !HasExifEntries(ctx)) return 1;
     zanBeginTiffEXIFDir(tif);
-    if (!zanCreateTiffEXIFDir(tif)) {
-        zanEndTiffEXIFDir(tif);
-        return ReportError(ctx, "Cannot create EXIF entry in the TIFF directory");
-    }
-    for (const MetadataEntry* e = first; e; e = e->next)
-        if (IsExif(e)) SetExifEntry(ctx, tif, *e);
+    const bool created = zanCreateTiffEXIFDir(tif) != 0;
+    if (created)
+        for (const MetadataEntry* e = FirstExifEntry(ctx->writeMetadataList); e; e = e->next)
+            if (IsExif(e)) SetExifEntry(ctx, tif, *e);
     // libtiff cannot write an EXIF directory without entries (it fails, or
-    // worse): when the codec took none of them, the page stays without one.
-    // The empty EXIF directory gives way to a fresh image directory for the
-    // next page (the page itself is written and linked already).
-    if (TIFFGetTagListCount(tif) == 0) {
-        TIFFFreeDirectory(tif);
-        TIFFCreateDirectory(tif);
-        zanEndTiffEXIFDir(tif);
+    // worse): when the codec took none of them, the page goes without one.
+    const bool anything = created && TIFFGetTagListCount(tif) > 0;
+    const bool written = anything && TIFFWriteEXIFDirectoryPivlo(tif) != 0;
+    // A fresh image directory for the next page, whatever happened.
+    TIFFFreeDirectory(tif);
+    TIFFCreateDirectory(tif);
+    zanEndTiffEXIFDir(tif);
+    if (!created || !anything || !written) {
+        const bool unlinked = TIFFSetLastPageEXIFPivlo(tif, 0) != 0;
+        if (!created) return ReportError(ctx, "Cannot create EXIF entry in the TIFF directory");
+        if (anything) return ReportError(ctx, "TIFF EXIF write error");
+        if (!unlinked) return ReportError(ctx, "Cannot create EXIF entry in the TIFF directory");
         return 1;
     }
-    const bool written = TIFFWriteEXIFDirectoryPivlo(tif) != 0;
-    // Back to the page, whatever happened to the EXIF directory.
-    const bool pageAgain = TIFFSetDirectory(tif, page) != 0;
-    zanEndTiffEXIFDir(tif);
-    if (!written) return ReportError(ctx, "TIFF EXIF write error");
-    if (!pageAgain) return ReportError(ctx, "Cannot set TIFF directory");
-    if (!TIFFSetField(tif, TIFFTAG_EXIFIFD, TIFFLastEXIFOffsetPivlo(tif)))
+    if (!TIFFSetLastPageEXIFPivlo(tif, TIFFLastEXIFOffsetPivlo(tif)))
         return ReportError(ctx, "Cannot create EXIF entry in the TIFF directory");
-    if (!TIFFRewriteDirectory(tif) || TIFFIOFailedPivlo(tif)) return ReportError(ctx, "TIFF EXIF write error");
+    if (TIFFIOFailedPivlo(tif)) return ReportError(ctx, "TIFF EXIF write error");
     return 1;
 }
 

@@ -88,17 +88,15 @@ extern "C" ZAN_API int zanConcatenateTIFF(ConversionContext* ctx) {
     options.convertByteOrder = true;
     uint32_t position = static_cast<uint32_t>(end + (end & 1));
     uint32_t ifd = source.firstIfd;
+    // Each page is written whole first and linked last, so that the
+    // destination never points at a page that is not all there.
     for (uint32_t page = 0; page < pages && ifd != 0; ++page) {
-        if (!WriteLink(ctx, dest.stream, dest.order, link, position)) return 0;
         PageCopyResult copied;
         if (!copyTiffPage(ctx, source.stream, source.size, ifd, source.order, dest.stream, position,
-                          dest.order, options, &copied)) {
-            // Unlink the page that could not be copied: the destination keeps
-            // its former pages and stays readable.
-            WriteLink(ctx, dest.stream, dest.order, link, 0);
-            std::fflush(dest.stream);
+                          dest.order, options, &copied))
             return 0;
-        }
+        if (!WriteLink(ctx, dest.stream, dest.order, link, position)) return 0;
+        if (std::fflush(dest.stream) != 0) return ReportError(ctx, "Unable to write to destination file.");
         link = copied.nextIfdField;
         position = copied.dataEnd;
         ifd = copied.nextIfd;

@@ -138,6 +138,9 @@ constexpr uint16_t kStripByteCounts = 279, kTileByteCounts = 325;
 constexpr uint16_t kNewSubfileType = 254, kPageNumber = 297;
 constexpr uint16_t kBitsPerSample = 258, kCompression = 259;
 constexpr uint16_t kExifIfd = 34665, kGpsIfd = 34853, kInteropIfd = 40965;
+constexpr uint16_t kSubIfds = 330;
+constexpr uint16_t kJpegInterchange = 513, kJpegInterchangeLength = 514;
+constexpr uint16_t kJpegQTables = 519, kJpegDcTables = 520, kJpegAcTables = 521;
 constexpr uint16_t kShort = 3, kLong = 4, kDouble = 12, kIfd = 13;
 constexpr uint32_t kMaxOffset = std::numeric_limits<uint32_t>::max();
 
@@ -154,17 +157,22 @@ constexpr uint32_t kRunGap = 4096;
 // entries lead to (EXIF and GPS from the page, Interoperability from EXIF).
 enum class DirKind { Page, Exif, Gps, Interop };
 
+// EXIF, GPS and Interoperability directories a page may have: a real page
+// has one of each at most; repeated pointers to one directory share it.
+constexpr uint32_t kMostSubDirectories = 64;
+
+constexpr char kUnmovableTables[] =
+    "Old-style JPEG tables outside the JPEG interchange data cannot be copied.";
+
 uint64_t Even(uint64_t position) { return position + (position & 1); }
 
-// Size in bytes of one value of a field type; 0 for types the walker does
-// not accept.
-uint32_t TypeSize(uint16_t type, bool acceptIfdType) {
+// Size in bytes of one value of a field type; 0 for unknown types.
+uint32_t TypeSize(uint16_t type) {
     switch (type) {
     case 1: case 2: case 6: case 7: return 1;
     case 3: case 8: return 2;
-    case 4: case 9: case 11: return 4;
+    case 4: case 9: case 11: case 13: return 4;
     case 5: case 10: case 12: return 8;
-    case 13: return acceptIfdType ? 4 : 0;
     default: return 0;
     }
 }
@@ -227,9 +235,12 @@ public:
           byteCounts_(ctx), newOffsets_(ctx), runIn_(ctx), runOut_(ctx) {}
 
     int Copy(uint32_t ifd, uint32_t position, PageCopyResult* result) {
+        // What a page copy writes comes from the source, a few pad bytes and
+        // widened offsets aside: a page that would write much more than the
+        // source holds refers to the same data over and over.
+        budget_ = std::min<uint64_t>(kMaxOffset, uint64_t{position} + 3 * sourceSize_ + 65536);
         uint64_t bound = position;
         if (!Inspect(ifd, DirKind::Page, &bound)) return 0;
-        if (bound > kMaxOffset) return Fail("Destination would exceed 4 GiB.");
         data_ = position;
         if (!WriteDirectory(ifd, position, DirKind::Page, result)) return 0;
         if (std::fflush(destFile_) != 0) return Fail("Unable to write to destination file.");
@@ -265,7 +276,7 @@ private:
         e.tag = in_.Get16(e.raw);
         e.type = in_.Get16(e.raw + 2);
         e.count = in_.Get32(e.raw + 4);
-        e.byteSize = uint64_t{e.count} * TypeSize(e.type, options_.acceptIfdType);
+        e.byteSize = uint64_t{e.count} * TypeSize(e.type);
         e.value = in_.Get32(e.raw + 8);
         return e;
     }
@@ -286,9 +297,10 @@ private:
         return true;
     }
 
-    // Loads the strip offsets or byte counts of `e` into `array`: from the
-    // entry when they fit in it, else from the source, widened to 32 bits.
-    bool LoadStripNumbers(const Entry& e, NumberArray& array, uint64_t* total) {
+    // Loads the SHORT or LONG numbers of `e` (strip offsets, byte counts,
+    // ...) into `array`: from the entry when they fit in it, else from the
+    // source, widened to 32 bits; adds them to `total` when given.
+    bool LoadNumbers(const Entry& e, NumberArray& array, uint64_t* total = nullptr) {
         // The numbers must be in the file before memory is taken for them.
         if (e.byteSize > 4 && uint64_t{e.value} + e.byteSize > sourceSize_)
             return Fail("Source value lies beyond the end of the file.");
@@ -329,12 +341,12 @@ private:
             if (offsets_.present()) return Fail("Strip and Tile offsets both present.");
             offsetsType_ = e.type;
             offsetsByteSize_ = e.byteSize;
-            return LoadStripNumbers(e, offsets_, nullptr);
+            return LoadNumbers(e, offsets_);
         }
         if (!TakeStripCount(e, "Source num of strips and num of stripsize do not match."))
             return false;
         if (byteCounts_.present()) return Fail("Strip and Tile byte counts both present.");
-        return LoadStripNumbers(e, byteCounts_, &totalBytes_);
+        return LoadNumbers(e, byteCounts_, &totalBytes_);
     }
 
     // Checks the strips once both arrays are known, and adds the offsets
@@ -353,8 +365,86 @@ private:
             std::min<uint64_t>(kRunBufferSize, totalBytes_ + uint64_t{stripCount_} + 1));
         if (!newOffsets_.Allocate(stripCount_) || !runIn_.Allocate(runSize) || !runOut_.Allocate(runSize))
             return Fail("Memory allocation error.");
-        *bound += 4 * uint64_t{stripCount_} + 1 + totalBytes_ + stripCount_;
+        return Grow(bound, 4 * uint64_t{stripCount_} + 1 + totalBytes_ + stripCount_);
+    }
+
+    // Adds `bytes` (at an even offset) to the destination's size bound;
+    // false (reported) once the bound passes what the page may write.
+    bool Grow(uint64_t* bound, uint64_t bytes) {
+        *bound = Even(*bound) + bytes;
+        if (*bound <= budget_) return true;
+        return Fail(*bound > kMaxOffset ? "Destination would exceed 4 GiB."
+                                        : "Source page refers to the same data too many times.");
+    }
+
+    // The sub-directory `offset` of `kind` met before in this page, or null.
+    // Each is inspected and written once, whatever number of entries point
+    // at it.
+    struct SubDirectory {
+        uint32_t source;
+        DirKind kind;
+        uint32_t dest;  // 0 until written
+    };
+    SubDirectory* FindSubDirectory(uint32_t offset, DirKind kind) {
+        for (uint32_t i = 0; i < subDirectoryCount_; ++i)
+            if (subDirectories_[i].source == offset && subDirectories_[i].kind == kind) return &subDirectories_[i];
+        return nullptr;
+    }
+
+    bool InspectSubDirectory(uint32_t offset, DirKind kind, uint64_t* bound) {
+        if (FindSubDirectory(offset, kind)) return true;
+        if (subDirectoryCount_ == kMostSubDirectories)
+            return Fail("Source page has too many EXIF, GPS or Interoperability directories.");
+        subDirectories_[subDirectoryCount_++] = SubDirectory{offset, kind, 0};
+        return Inspect(offset, kind, bound);
+    }
+
+    // Types the copy can take: every known type, and IFD (13) for the
+    // pointers it relocates, or anywhere when asked to (extraction copies
+    // other IFD fields as the numbers they are).
+    bool TypeAccepted(DirKind kind, const Entry& e) const {
+        if (TypeSize(e.type) == 0) return false;
+        DirKind sub;
+        return e.type != kIfd || options_.acceptIfdType || SubDirectoryOf(kind, e, &sub);
+    }
+
+    // Fields that hold file offsets the copy does not relocate would point
+    // into the wrong place of the destination: such pages are refused.
+    bool CheckOffsetFields(const Entry& e) {
+        if (e.tag == kSubIfds) return Fail("Pages with SubIFDs cannot be copied.");
+        if (e.tag == kJpegInterchange) {
+            if (e.count != 1 || (e.type != kLong && e.type != kIfd) || e.value == 0 || e.value >= sourceSize_)
+                return Fail("Source value lies beyond the end of the file.");
+            jpegBlockAt_ = e.value;
+        } else if (e.tag == kJpegInterchangeLength && e.count == 1 && (e.type == kLong || e.type == kShort)) {
+            jpegBlockLength_ = e.type == kLong ? e.value : in_.Get16(e.raw + 8);
+        } else if (e.tag == kJpegQTables || e.tag == kJpegDcTables || e.tag == kJpegAcTables) {
+            if (e.type != kLong || e.count == 0 || tableEntryCount_ == 3) return Fail(kUnmovableTables);
+            tableEntries_[tableEntryCount_++] = e;
+        }
         return true;
+    }
+
+    // The old-style JPEG data (JPEGInterchangeFormat) is copied as one
+    // block: its length, or up to the first strip behind it when the page
+    // gives none (libtiff then reads to the end of the file, and only as far
+    // as the scan header). Its tables must lie inside it, so that they move
+    // with it.
+    bool InspectJpegBlock(uint64_t* bound) {
+        if (jpegBlockAt_ == 0) return tableEntryCount_ == 0 || Fail(kUnmovableTables);
+        uint64_t end = sourceSize_;
+        if (jpegBlockLength_ != 0) end = std::min<uint64_t>(end, uint64_t{jpegBlockAt_} + jpegBlockLength_);
+        else
+            for (uint32_t i = 0; i < stripCount_ && offsets_.present(); ++i)
+                if (offsets_[i] > jpegBlockAt_) end = std::min<uint64_t>(end, offsets_[i]);
+        jpegBlockLength_ = static_cast<uint32_t>(end - jpegBlockAt_);
+        for (uint32_t t = 0; t < tableEntryCount_; ++t) {
+            NumberArray tables(ctx_);
+            if (!LoadNumbers(tableEntries_[t], tables)) return false;
+            for (uint32_t i = 0; i < tables.size(); ++i)
+                if (tables[i] < jpegBlockAt_ || tables[i] >= end) return Fail(kUnmovableTables);
+        }
+        return Grow(bound, jpegBlockLength_);
     }
 
     // First pass over a directory: every check, no writing.
@@ -363,34 +453,36 @@ private:
         ByteBuffer directory(ctx_);
         if (!LoadDirectory(ifd, directory, &count, "Source directory lies beyond the end of the file."))
             return false;
-        *bound = Even(*bound) + 2 + 12u * uint64_t{count} + 4;
+        if (!Grow(bound, 2 + 12u * uint64_t{count} + 4)) return false;
         for (uint32_t i = 0; i < count; ++i) {
             const Entry e = EntryAt(directory, i);
-            if (TypeSize(e.type, options_.acceptIfdType) == 0) return Fail("Unhandled TIFF TYPE.");
+            if (!TypeAccepted(kind, e)) return Fail("Unhandled TIFF TYPE.");
             if (kind == DirKind::Page && (IsOffsets(e) || IsByteCounts(e)) && !InspectStripEntry(e))
                 return false;
-            if (kind == DirKind::Page && !NoteSampleLayout(e)) return false;
+            if (kind == DirKind::Page && (!NoteSampleLayout(e) || !CheckOffsetFields(e))) return false;
             DirKind sub;
             if (e.byteSize <= 4 && SubDirectoryOf(kind, e, &sub)) {
-                if (!Inspect(e.value, sub, bound)) return false;
+                if (!InspectSubDirectory(e.value, sub, bound)) return false;
             } else if (e.byteSize > 4 && !(kind == DirKind::Page && IsOffsets(e))) {
                 if (uint64_t{e.value} + e.byteSize > sourceSize_)
                     return Fail("Source value lies beyond the end of the file.");
                 if (options_.convertByteOrder && e.type == kDouble) return Fail("Unhandled type.");
-                *bound = Even(*bound) + e.byteSize;
+                if (!Grow(bound, e.byteSize)) return false;
             }
         }
-        return kind != DirKind::Page || (InspectStrips(bound) && ChooseSampleSwap());
+        return kind != DirKind::Page || (InspectStrips(bound) && InspectJpegBlock(bound) && ChooseSampleSwap());
     }
 
     // Remembers the page's BitsPerSample (all values must agree when they
     // are wide) and Compression.
+    // Both may be stored as SHORT or as LONG.
     bool NoteSampleLayout(const Entry& e) {
-        if (e.tag == kCompression && e.type == kShort && e.count == 1) {
-            compression_ = in_.Get16(e.raw + 8);
-        } else if (e.tag == kBitsPerSample && e.type == kShort && e.count > 0) {
+        const bool number = e.type == kShort || e.type == kLong;
+        if (e.tag == kCompression && number && e.count == 1) {
+            compression_ = e.type == kShort ? in_.Get16(e.raw + 8) : e.value;
+        } else if (e.tag == kBitsPerSample && number && e.count > 0) {
             NumberArray bits(ctx_);
-            if (!LoadStripNumbers(e, bits, nullptr)) return false;
+            if (!LoadNumbers(e, bits)) return false;
             bitsPerSample_ = bits[0];
             for (uint32_t i = 1; i < e.count; ++i)
                 if (bits[i] != bits[0]) mixedBits_ = true;
@@ -520,6 +612,12 @@ private:
         data_ = std::max<uint64_t>(data_, uint64_t{at} + 2 + entriesSize + 4);
         Entry offsetsEntry;
         unsigned char* offsetsRaw = nullptr;
+        // The old-style JPEG data goes first, so that the entries that point
+        // into it know its new place.
+        if (kind == DirKind::Page && jpegBlockAt_ != 0) {
+            jpegBlockDest_ = static_cast<uint32_t>(data_);
+            if (!CopyData(jpegBlockAt_, jpegBlockLength_, 0)) return false;
+        }
         for (uint32_t i = 0; i < count; ++i) {
             const Entry e = EntryAt(source, i);
             unsigned char* const raw = entries + 12u * i;
@@ -528,11 +626,12 @@ private:
                 offsetsEntry = e;
                 offsetsRaw = raw;  // filled in once the strips have their places
             } else if (e.byteSize <= 4 && SubDirectoryOf(kind, e, &sub)) {
-                const uint64_t subAt = Even(data_);
-                data_ = subAt;
-                if (!WriteDirectory(e.value, static_cast<uint32_t>(subAt), sub, nullptr)) return false;
+                uint32_t subAt = 0;
+                if (!WriteSubDirectory(e.value, sub, &subAt)) return false;
                 PutEntryHead(e, e.type, raw);
-                out_.Put32(static_cast<uint32_t>(subAt), raw + 8);
+                out_.Put32(subAt, raw + 8);
+            } else if (kind == DirKind::Page && IsJpegOffset(e)) {
+                if (!WriteJpegOffsets(e, raw)) return false;
             } else if (e.byteSize <= 4) {
                 InlineEntry(e, kind, raw);
             } else {
@@ -548,6 +647,44 @@ private:
             if (offsetsRaw && !WriteStrips(offsetsEntry, offsetsRaw)) return false;
         }
         return WriteAt(at, image.data(), 2 + entriesSize + 4);
+    }
+
+    // Writes the sub-directory at `offset` once: later entries pointing at
+    // it get the place it was written to.
+    bool WriteSubDirectory(uint32_t offset, DirKind kind, uint32_t* at) {
+        SubDirectory* sub = FindSubDirectory(offset, kind);
+        if (sub && sub->dest != 0) {
+            *at = sub->dest;
+            return true;
+        }
+        data_ = Even(data_);
+        *at = static_cast<uint32_t>(data_);
+        if (sub) sub->dest = *at;
+        return WriteDirectory(offset, *at, kind, nullptr);
+    }
+
+    static bool IsJpegOffset(const Entry& e) {
+        return e.tag == kJpegInterchange || e.tag == kJpegQTables || e.tag == kJpegDcTables ||
+               e.tag == kJpegAcTables;
+    }
+
+    // JPEGInterchangeFormat and the old-style tables, moved with the JPEG
+    // data: one offset in the entry, or an array of them at the data
+    // position (all LONG).
+    bool WriteJpegOffsets(const Entry& e, unsigned char* raw) {
+        NumberArray numbers(ctx_);
+        if (!LoadNumbers(e, numbers)) return false;
+        for (uint32_t i = 0; i < numbers.size(); ++i) numbers[i] = numbers[i] - jpegBlockAt_ + jpegBlockDest_;
+        PutEntryHead(e, e.type, raw);
+        if (numbers.size() == 1) {
+            out_.Put32(numbers[0], raw + 8);
+            return true;
+        }
+        const uint64_t arrayAt = data_;
+        out_.Put32(static_cast<uint32_t>(arrayAt), raw + 8);
+        if (!WriteNumbers(arrayAt, numbers.data(), numbers.size(), 4)) return false;
+        data_ = Even(data_ + 4 * uint64_t{numbers.size()});
+        return true;
     }
 
     // Gives every strip its place behind the data position, each at an
@@ -571,7 +708,7 @@ private:
         const uint32_t width = type == kShort ? 2 : 4;
         if (byteSize > 4) {
             out_.Put32(static_cast<uint32_t>(arrayAt), raw + 8);
-            if (!WriteOffsetsArray(arrayAt, width)) return false;
+            if (!WriteNumbers(arrayAt, newOffsets_.data(), stripCount_, width)) return false;
             data_ = Even(data_ + byteSize);
         } else {
             for (uint32_t i = 0; i < stripCount_ && i < 4 / width; ++i) {
@@ -636,13 +773,15 @@ private:
         return WriteAt(runAt, runOut_.data(), static_cast<size_t>(data_ - runAt));
     }
 
-    bool WriteOffsetsArray(uint64_t at, uint32_t width) {
+    // Writes `count` numbers at `at`, each `width` (2 or 4) bytes in the
+    // destination order.
+    bool WriteNumbers(uint64_t at, const uint32_t* numbers, uint32_t count, uint32_t width) {
         unsigned char buffer[kCopyBufferSize];
-        for (uint32_t i = 0; i < stripCount_;) {
-            const uint32_t n = std::min<uint32_t>(stripCount_ - i, kCopyBufferSize / width);
+        for (uint32_t i = 0; i < count;) {
+            const uint32_t n = std::min<uint32_t>(count - i, kCopyBufferSize / width);
             for (uint32_t k = 0; k < n; ++k) {
-                if (width == 2) out_.Put16(static_cast<uint16_t>(newOffsets_[i + k]), buffer + 2 * k);
-                else out_.Put32(newOffsets_[i + k], buffer + 4 * k);
+                if (width == 2) out_.Put16(static_cast<uint16_t>(numbers[i + k]), buffer + 2 * k);
+                else out_.Put32(numbers[i + k], buffer + 4 * k);
             }
             if (!WriteAt(at + uint64_t{i} * width, buffer, n * width)) return false;
             i += n;
@@ -671,6 +810,14 @@ private:
     uint32_t bitsPerSample_ = 1;    // first BitsPerSample value (1 when absent)
     bool mixedBits_ = false;        // BitsPerSample values differ
     uint32_t sampleSwapUnit_ = 0;   // bytes per image sample to reverse (0: none)
+    uint64_t budget_ = kMaxOffset;  // the most the destination may grow to for this page
+    SubDirectory subDirectories_[kMostSubDirectories] = {};
+    uint32_t subDirectoryCount_ = 0;
+    uint32_t jpegBlockAt_ = 0;      // old-style JPEG data in the source (0: none)
+    uint32_t jpegBlockLength_ = 0;
+    uint32_t jpegBlockDest_ = 0;    // ... and in the destination
+    Entry tableEntries_[3];         // old-style JPEG tables, which point into that data
+    uint32_t tableEntryCount_ = 0;
 };
 
 }  // namespace

@@ -14,6 +14,7 @@
 #include "osttiff/osttiff.h"
 #include "pivlo/pivlo.h"
 #include "read/colour_channels.h"
+#include "read/reader_buffers.h"
 #include "zantiff/zantiff.h"
 
 namespace zan {
@@ -113,8 +114,12 @@ bool CopyIccProfile(ConversionContext* ctx, TIFF* tif) {
     return true;
 }
 
-// Undoes the open of a failed zanTIFFGetInfo.
+// Ends the job of a failed zanTIFFGetInfo: the reader's buffers of a page
+// being read, the codec object and the source go, and the job is idle, so
+// that no later call works with what was closed.
 int CloseFailedJob(ConversionContext* ctx) {
+    if (ctx->state == ZAN_STATE_READING) ReleaseReaderBuffers(ctx);
+    ctx->state = ZAN_STATE_IDLE;
     RestoreCodecMessages(ctx);
     if (ctx->tiff) {
         TIFFClose(ctx->tiff);
@@ -129,16 +134,6 @@ int CloseFailedJob(ConversionContext* ctx) {
 
 bool SourceCanReread(const ConversionContext* ctx) {
     return !(ctx->sourceKind == ZAN_SOURCE_STREAM && !ctx->sourceSeekProc);
-}
-
-bool GetStoredExtraSamples(const ConversionContext* ctx, TIFF* tif, uint16_t* count,
-                           const uint16_t** values) {
-    if (SourceCanReread(ctx)) return TIFFGetStoredExtraSamplesPivlo(tif, count, values) != 0;
-    uint16_t* libtiffValues = nullptr;
-    if (!TIFFGetFieldDefaulted(tif, TIFFTAG_EXTRASAMPLES, count, &libtiffValues)) return false;
-    static const uint16_t kNone[1] = {0};
-    *values = libtiffValues ? libtiffValues : kNone;
-    return true;
 }
 
 bool SelectPage(TIFF* tif, int32_t pageNumber) {
@@ -171,7 +166,7 @@ int ReadImageDescription(ConversionContext* ctx, TIFF* tif) {
 
     uint16_t extraCount = 0;
     const uint16_t* extraValues = nullptr;
-    if (!GetStoredExtraSamples(ctx, tif, &extraCount, &extraValues)) return ReportError(ctx, kFieldError);
+    if (!TIFFGetStoredExtraSamplesPivlo(tif, &extraCount, &extraValues)) return ReportError(ctx, kFieldError);
     if (extraCount == 0) extraCount = SurplusSamples(samples, photometric);
     extraCount = std::min(extraCount, samples);  // a count beyond the samples is damage
     ctx->samplesPerPixel = samples;
@@ -207,6 +202,11 @@ int ReadImageDescription(ConversionContext* ctx, TIFF* tif) {
 extern "C" ZAN_API int zanTIFFGetInfo(ConversionContext* ctx) {
     using namespace zan;
     if (!ctx) return 0;
+    // The codec object of a job that writes pages is no page to describe.
+    if (ctx->state == ZAN_STATE_WRITING || ctx->state == ZAN_STATE_PAGE_CLOSED) {
+        zanError(ctx, "Can not read while writing.");
+        return 0;
+    }
     zanResetFrameBuffer(ctx);
     if (!OpenTIFFForReading(ctx)) return 0;
     TIFF* tif = ctx->tiff;

@@ -20,9 +20,4 @@ bool SelectPage(TIFF* tif, int32_t pageNumber);
 // source but a stream read through the stream buffer service).
 bool SourceCanReread(const ConversionContext* ctx);
 
-// ExtraSamples of the current directory as the file stores it (count 0 when
-// absent), or libtiff's answer when the source cannot be read again.
-bool GetStoredExtraSamples(const ConversionContext* ctx, TIFF* tif, uint16_t* count,
-                           const uint16_t** values);
-
 }  // namespace zan

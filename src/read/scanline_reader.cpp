@@ -6,12 +6,14 @@
 #include <cstring>
 #include <limits>
 
+#include "frame/checked_size.h"
 #include "frame/codec_messages.h"
 #include "frame/host_memory.h"
 #include "frame/tiff_open.h"
 #include "osttiff/osttiff.h"
 #include "pivlo/pivlo.h"
 #include "read/colour_channels.h"
+#include "read/page_data.h"
 #include "read/page_description.h"
 #include "read/reader_buffers.h"
 #include "read/row_conversions.h"
@@ -102,15 +104,24 @@ bool CopyPalette(ConversionContext* ctx, TIFF* tif) {
     return true;
 }
 
+// How rows reach the reader (`readByStrip`): one scanline at a time, out of
+// a block of decoded rows (JPEG strips, bands of tiles), or out of a band
+// the codec's RGBA reader converted to RGB (YCbCr pages other than JPEG,
+// whose samples are stored in subsampled blocks).
+enum RowSource : uint32_t { kScanlines = 0, kBlocks = 1, kRgbaBands = 2 };
+
+constexpr char kLineTooLong[] = "A line of the page is larger than 4 GiB.";
+
 // Rows of a JPEG page come out of strips decoded in RGB, and rows of a tiled
 // page out of a band of tiles (one row of tiles, all planes) assembled in
 // the strip buffer; a tiled page's buffer also holds one tile after the band.
 // The buffer holds what the codec delivers once RGB output is asked for.
-bool SetUpBlockReading(ConversionContext* ctx, TIFF* tif, bool jpeg, uint64_t* rowBytes) {
+// Returns the message of a failure, or null.
+const char* SetUpBlockReading(ConversionContext* ctx, TIFF* tif, bool jpeg, uint64_t* rowBytes) {
     if (jpeg) {
         TIFFSetField(tif, TIFFTAG_JPEGCOLORMODE, JPEGCOLORMODE_RGB);
         const tmsize_t rgbRow = TIFFScanlineSize(tif);
-        if (rgbRow <= 0) return false;
+        if (rgbRow <= 0) return "Unable to work out the size of a line.";
         *rowBytes = static_cast<uint64_t>(rgbRow);
     }
     const bool tiled = TIFFIsTiled(tif);
@@ -118,25 +129,67 @@ bool SetUpBlockReading(ConversionContext* ctx, TIFF* tif, bool jpeg, uint64_t* r
     uint64_t size = 0;
     if (tiled) {
         const tmsize_t tile = TIFFTileSize(tif);
-        if (!TIFFGetField(tif, TIFFTAG_TILELENGTH, &bandRows) || bandRows == 0 || tile <= 0) return false;
-        size = *rowBytes * bandRows + static_cast<uint64_t>(tile);
+        if (!TIFFGetField(tif, TIFFTAG_TILELENGTH, &bandRows) || bandRows == 0)
+            return "Error getting tileheight field.";
+        if (tile <= 0) return "Unable to work out the size of a tile.";
+        if (!MultiplySizes(*rowBytes, bandRows, &size)) return kLineTooLong;
+        size += static_cast<uint64_t>(tile);
     } else {
         TIFFGetFieldDefaulted(tif, TIFFTAG_ROWSPERSTRIP, &bandRows);
         bandRows = std::max<uint32_t>(1, std::min(bandRows, ctx->imageHeight));
         const tmsize_t strip = TIFFStripSize(tif);
-        size = std::max<uint64_t>(static_cast<uint64_t>(std::max<tmsize_t>(strip, 0)), *rowBytes * bandRows);
+        if (!MultiplySizes(*rowBytes, bandRows, &size)) return kLineTooLong;
+        size = std::max<uint64_t>(static_cast<uint64_t>(std::max<tmsize_t>(strip, 0)), size);
     }
+    if (!FitsIn32(size) || !FitsIn32(*rowBytes)) return kLineTooLong;
     ctx->rowsPerStrip = bandRows;
     ctx->stripCount = tiled ? TIFFNumberOfTiles(tif) : TIFFNumberOfStrips(tif);
     ctx->nextStrip = 0;
-    if (!AllocateField(ctx, ctx->stripBuffer, size)) return false;
+    if (!AllocateField(ctx, ctx->stripBuffer, size)) return kMemoryError;
     ctx->stripBufferSize = static_cast<uint32_t>(size);
     ctx->scanlineSize = ctx->lineBytes = static_cast<uint32_t>(*rowBytes);
-    ctx->readByStrip = 1;
-    return true;
+    ctx->readByStrip = kBlocks;
+    return nullptr;
+}
+
+// A YCbCr page that is not JPEG keeps its chroma in subsampled blocks; the
+// codec's RGBA reader turns a band of rows (a strip's or a row of tiles'
+// worth) into RGB, and the lines are RGB. Returns the message of a failure,
+// or null.
+const char* SetUpRgbaBands(ConversionContext* ctx, TIFF* tif) {
+    if (ctx->bitsPerSample != 8 || ctx->fileSamplesPerPixel != 3)
+        return "Only 8-bit YCbCr pages of three samples are supported line by line.";
+    char message[1024] = "";
+    TIFFRGBAImage probe;
+    if (!TIFFRGBAImageBegin(&probe, tif, 0, message)) {
+        TIFFError(TIFFFileName(tif), "%s", message);
+        return "Unable to convert the page's YCbCr samples to RGB.";
+    }
+    TIFFRGBAImageEnd(&probe);
+    uint32_t bandRows = 0;
+    if (TIFFIsTiled(tif)) {
+        if (!TIFFGetField(tif, TIFFTAG_TILELENGTH, &bandRows) || bandRows == 0)
+            return "Error getting tileheight field.";
+    } else {
+        TIFFGetFieldDefaulted(tif, TIFFTAG_ROWSPERSTRIP, &bandRows);
+    }
+    bandRows = std::max<uint32_t>(1, std::min(bandRows, ctx->imageHeight));
+    uint64_t raster = 0, line = 0;
+    if (!MultiplySizes(ctx->imageWidth, bandRows, 4, &raster) || !FitsIn32(raster) ||
+        !MultiplySizes(ctx->imageWidth, 3, &line) || !FitsIn32(line))
+        return kLineTooLong;
+    if (!AllocateField(ctx, ctx->stripBuffer, raster)) return kMemoryError;
+    ctx->stripBufferSize = static_cast<uint32_t>(raster);
+    ctx->rowsPerStrip = bandRows;
+    ctx->nextStrip = 0;
+    ctx->planarConfig = 1;  // RGB lines, whatever the planes were
+    ctx->scanlineSize = ctx->lineBytes = static_cast<uint32_t>(line);
+    ctx->readByStrip = kRgbaBands;
+    return nullptr;
 }
 
 // Chooses the conversions of the page and obtains the buffers they need.
+// Every size is worked out in 64 bits and refused beyond 32 bits.
 uint32_t SetUpPage(ConversionContext* ctx) {
     const bool openedHere = ctx->state != ZAN_STATE_DESCRIBED && !ctx->tiff;
     ctx->currentRow = 0;
@@ -167,7 +220,10 @@ uint32_t SetUpPage(ConversionContext* ctx) {
         return fail("Only supports 2, 4(palette), 2, 4, 8, 16 or 1 bitspersample.");
     TIFFGetFieldDefaulted(tif, TIFFTAG_SAMPLESPERPIXEL, &samples);
     ctx->fileSamplesPerPixel = samples;
-    const uint32_t width = ctx->imageWidth;
+    const uint64_t width = ctx->imageWidth;
+    // Nothing is sized from the page's claims before its data is known to
+    // be able to hold them.
+    if (!PageDataCanHold(tif, StoredImageBytes(tif))) return fail(kPageDataTooSmall);
 
     // Extra samples: those the directory lists, or the surplus over the
     // colour channels of a page without the tag (the first taken as
@@ -175,7 +231,7 @@ uint32_t SetUpPage(ConversionContext* ctx) {
     const uint16_t colours = colourChannelCount(photometric);
     uint16_t listed = 0;
     const uint16_t* kinds = nullptr;
-    if (!GetStoredExtraSamples(ctx, tif, &listed, &kinds)) return fail("Error getting tiff field.");
+    if (!TIFFGetStoredExtraSamplesPivlo(tif, &listed, &kinds)) return fail("Error getting tiff field.");
     uint32_t extra = 0;
     if (listed > 0) {
         const uint16_t* alpha = std::find(kinds, kinds + listed, EXTRASAMPLE_ASSOCALPHA);
@@ -194,32 +250,45 @@ uint32_t SetUpPage(ConversionContext* ctx) {
     TIFFGetFieldDefaulted(tif, TIFFTAG_FILLORDER, &fillOrder);
     if (fillOrder == 1 || fillOrder == 2) ctx->fillOrder = fillOrder;
 
+    if (photometric == PHOTOMETRIC_YCBCR && compression != COMPRESSION_JPEG) {
+        SetupFailure::ClearSetupFields(ctx);
+        if (const char* failure = SetUpRgbaBands(ctx, tif)) return fail(failure);
+        ctx->state = ZAN_STATE_READING;
+        return 1;
+    }
+
     // One row of all samples; for separate planes one plane's row times the
     // planes, so that the planes lie side by side without overlapping.
     const tmsize_t codecRow = TIFFScanlineSize(tif);
-    uint64_t rowBytes = static_cast<uint64_t>(std::max<tmsize_t>(codecRow, 0)) *
-                              (ctx->planarConfig == 2 ? samples : 1u);
-    if (codecRow <= 0 || rowBytes > std::numeric_limits<uint32_t>::max()) return fail("Error getting tiff field.");
+    if (codecRow <= 0) return fail("Unable to work out the size of a line.");
+    uint64_t rowBytes = 0;
+    if (!MultiplySizes(static_cast<uint64_t>(codecRow), ctx->planarConfig == 2 ? samples : 1u, &rowBytes) ||
+        !FitsIn32(rowBytes))
+        return fail(kLineTooLong);
     ctx->scanlineSize = ctx->lineBytes = static_cast<uint32_t>(rowBytes);
-    if ((compression == COMPRESSION_JPEG || TIFFIsTiled(tif)) &&
-        !SetUpBlockReading(ctx, tif, compression == COMPRESSION_JPEG, &rowBytes))
-        return fail(kMemoryError);
+    if (compression == COMPRESSION_JPEG || TIFFIsTiled(tif))
+        if (const char* failure = SetUpBlockReading(ctx, tif, compression == COMPRESSION_JPEG, &rowBytes))
+            return fail(failure);
 
-    const uint64_t pixels = width;
+    // The line the host receives and the work line behind it, in 64 bits.
+    const uint64_t allSamples = uint64_t{samples} * width;
+    uint64_t lineBytes = rowBytes;
     if (photometric == PHOTOMETRIC_PALETTE) {
         if (bits != 2 && bits != 4 && bits != 8) return fail("Only supports 2 or 4 or 8 bit per sample palette tiff.");
         // The indices are the only sample of a palette page; a row of more
         // samples would not fit the RGB work line it is read into.
         if (samples != 1) return fail("Palette tiff with more than one sample per pixel not supported.");
-        if (!AllocateField(ctx, ctx->frameData, std::max<uint64_t>(pixels * 3, rowBytes))) return fail(kMemoryError);
+        lineBytes = width * 3;
+        if (!FitsIn32(lineBytes)) return fail(kLineTooLong);
+        if (!AllocateField(ctx, ctx->frameData, std::max<uint64_t>(lineBytes, rowBytes))) return fail(kMemoryError);
         ++ctx->paletteExpansion;
-        ctx->lineBytes = static_cast<uint32_t>(pixels * 3);
         if (!CopyPalette(ctx, tif)) return fail(nullptr);
     } else if (extra > 0) {
-        const uint64_t kept = (samples - extra) * pixels;
+        const uint64_t kept = (samples - extra) * width;
         // Narrow samples are widened to bytes in the work line before dropping.
-        const uint64_t work = bits < 8 ? std::max<uint64_t>(rowBytes, samples * pixels) : rowBytes;
-        ctx->lineBytes = static_cast<uint32_t>(bits == 16 && ctx->outputBitsPerSample == 16 ? kept * 2 : kept);
+        const uint64_t work = bits < 8 ? std::max<uint64_t>(rowBytes, allSamples) : rowBytes;
+        lineBytes = bits == 16 && ctx->outputBitsPerSample == 16 ? kept * 2 : kept;
+        if (!FitsIn32(lineBytes) || !FitsIn32(work)) return fail(kLineTooLong);
         if (!AllocateField(ctx, ctx->frameData, work)) return fail(kMemoryError);
         ctx->dropSampleCount = extra;
     }
@@ -228,12 +297,13 @@ uint32_t SetUpPage(ConversionContext* ctx) {
         ctx->reduceTo8Bits = ctx->outputBitsPerSample != 16;
         // 16-bit rows read into the host's line need no work line.
         if (extra == 0 && ctx->reduceTo8Bits) {
-            ctx->lineBytes = ctx->scanlineSize / 2;
+            lineBytes = rowBytes / 2;
             if (!AllocateField(ctx, ctx->frameData, rowBytes)) return fail(kMemoryError);
         }
     }
-    if (photometric != PHOTOMETRIC_PALETTE && (bits == 2 || bits == 4) && extra == 0)
-        ctx->lineBytes = static_cast<uint32_t>(samples * pixels);
+    if (photometric != PHOTOMETRIC_PALETTE && (bits == 2 || bits == 4) && extra == 0) lineBytes = allSamples;
+    if (!FitsIn32(lineBytes)) return fail(kLineTooLong);
+    ctx->lineBytes = static_cast<uint32_t>(lineBytes);
     ctx->state = ZAN_STATE_READING;
     return 1;
 }
@@ -244,6 +314,7 @@ bool ReadTileBand(ConversionContext* ctx, uint32_t row) {
     TIFF* tif = ctx->tiff;
     uint32_t tileWidth = 0;
     TIFFGetField(tif, TIFFTAG_TILEWIDTH, &tileWidth);
+    if (tileWidth == 0) return false;
     const uint32_t bandRows = ctx->rowsPerStrip;
     const uint32_t top = row / bandRows * bandRows;
     const uint32_t rows = std::min(bandRows, ctx->imageHeight - top);
@@ -255,6 +326,9 @@ bool ReadTileBand(ConversionContext* ctx, uint32_t row) {
     const size_t bandBytes = static_cast<size_t>(ctx->scanlineSize) * bandRows;
     uint8_t* const tile = ctx->stripBuffer + bandBytes;
     const tmsize_t tileSize = static_cast<tmsize_t>(ctx->stripBufferSize - bandBytes);
+    // The rows of one tile that the buffer holds: a tile's rows as the codec
+    // sizes them (never more than it decodes).
+    const size_t tileRows = tileRow ? std::min<size_t>(rows, static_cast<size_t>(tileSize) / tileRow) : 0;
     for (uint32_t plane = 0; plane < planes; ++plane)
         for (uint32_t x = 0; x < ctx->imageWidth; x += tileWidth) {
             const uint32_t index = TIFFComputeTile(tif, x, top, 0, static_cast<uint16_t>(plane));
@@ -262,12 +336,42 @@ bool ReadTileBand(ConversionContext* ctx, uint32_t row) {
             const uint32_t columns = std::min(tileWidth, ctx->imageWidth - x);
             const size_t from = static_cast<size_t>(uint64_t{x} * pixelBits / 8);
             const size_t bytes = std::min(tileRow, static_cast<size_t>((uint64_t{columns} * pixelBits + 7) / 8));
-            for (uint32_t r = 0; r < rows; ++r)
-                std::memcpy(ctx->stripBuffer + static_cast<size_t>(r) * ctx->scanlineSize +
-                                static_cast<size_t>(plane) * planeRow + from,
-                            tile + static_cast<size_t>(r) * tileRow, bytes);
+            for (size_t r = 0; r < tileRows; ++r)
+                std::memcpy(ctx->stripBuffer + r * ctx->scanlineSize + static_cast<size_t>(plane) * planeRow + from,
+                            tile + r * tileRow, bytes);
         }
     return true;
+}
+
+// Converts the band of rows from `top` to RGB in the strip buffer (a raster
+// of 32-bit RGBA pixels), rows in the order the page stores them.
+bool ReadRgbaBand(ConversionContext* ctx, uint32_t top) {
+    TIFF* tif = ctx->tiff;
+    char message[1024] = "";
+    TIFFRGBAImage image;
+    if (!TIFFRGBAImageBegin(&image, tif, 0, message)) {
+        TIFFError(TIFFFileName(tif), "%s", message);
+        return false;
+    }
+    image.req_orientation = image.orientation;  // no flips: rows as stored
+    image.row_offset = static_cast<int>(top);
+    image.col_offset = 0;
+    const uint32_t rows = std::min(ctx->rowsPerStrip, ctx->imageHeight - top);
+    const int got = TIFFRGBAImageGet(&image, reinterpret_cast<uint32_t*>(ctx->stripBuffer), ctx->imageWidth, rows);
+    TIFFRGBAImageEnd(&image);
+    return got != 0;
+}
+
+// Row `inBand` of the RGBA band as RGB bytes.
+void CopyRgbRow(const ConversionContext* ctx, uint32_t inBand, uint8_t* line) {
+    const uint8_t* pixel = ctx->stripBuffer + uint64_t{inBand} * ctx->imageWidth * 4;
+    for (uint32_t x = 0; x < ctx->imageWidth; ++x, pixel += 4, line += 3) {
+        uint32_t v;
+        std::memcpy(&v, pixel, 4);
+        line[0] = static_cast<uint8_t>(TIFFGetR(v));
+        line[1] = static_cast<uint8_t>(TIFFGetG(v));
+        line[2] = static_cast<uint8_t>(TIFFGetB(v));
+    }
 }
 
 // Reads row currentRow into `read`. False when the codec refuses (it has
@@ -275,7 +379,7 @@ bool ReadTileBand(ConversionContext* ctx, uint32_t row) {
 bool ReadRow(ConversionContext* ctx, uint8_t* read) {
     TIFF* tif = ctx->tiff;
     const uint32_t row = ctx->currentRow;
-    if (!ctx->readByStrip) {
+    if (ctx->readByStrip == kScanlines) {
         if (ctx->planarConfig != 2) return TIFFReadScanline(tif, read, row, 0) != -1;
         const uint32_t planes = ctx->fileSamplesPerPixel;
         const uint32_t planeRow = ctx->scanlineSize / planes;
@@ -286,19 +390,27 @@ bool ReadRow(ConversionContext* ctx, uint8_t* read) {
     }
     const uint32_t band = row / ctx->rowsPerStrip;
     if (ctx->nextStrip != band + 1) {
-        const bool read = TIFFIsTiled(tif)
-                              ? ReadTileBand(ctx, row)
-                              : TIFFReadEncodedStrip(tif, band, ctx->stripBuffer, ctx->stripBufferSize) != -1;
-        if (!read) return false;
+        bool loaded = false;
+        if (ctx->readByStrip == kRgbaBands) loaded = ReadRgbaBand(ctx, band * ctx->rowsPerStrip);
+        else if (TIFFIsTiled(tif)) loaded = ReadTileBand(ctx, row);
+        else loaded = TIFFReadEncodedStrip(tif, band, ctx->stripBuffer, ctx->stripBufferSize) != -1;
+        if (!loaded) return false;
         ctx->nextStrip = band + 1;
     }
     const uint32_t inBand = row % ctx->rowsPerStrip;
-    std::memcpy(read, ctx->stripBuffer + static_cast<size_t>(ctx->scanlineSize) * inBand, ctx->scanlineSize);
+    if (ctx->readByStrip == kRgbaBands) CopyRgbRow(ctx, inBand, read);
+    else std::memcpy(read, ctx->stripBuffer + static_cast<size_t>(ctx->scanlineSize) * inBand, ctx->scanlineSize);
     return true;
 }
 
+// Bytes the reader writes into the host's line: the delivered line, and a
+// row read straight into it before it is widened in place.
+uint64_t BytesWrittenToLine(const ConversionContext* ctx) {
+    return UsesWorkLine(ctx) ? ctx->lineBytes : std::max(ctx->lineBytes, ctx->scanlineSize);
+}
+
 uint32_t ReadNextRow(ConversionContext* ctx, uint8_t* line, uint32_t capacity) {
-    if (capacity < ctx->lineBytes) {
+    if (capacity < BytesWrittenToLine(ctx)) {
         zanError(ctx, "Not enough space in line buffer.");
         return 0;
     }
@@ -334,6 +446,10 @@ extern "C" ZAN_API uint32_t zanTIFFReadNextScanLine(ConversionContext* ctx, void
         if (!SetUpPage(ctx)) return 0;
         break;
     case ZAN_STATE_READING:
+        if (!ctx->tiff) {
+            zanError(ctx, "No page is open for reading.");
+            return 0;
+        }
         break;
     default:
         zanError(ctx, "Wrong state in zanTIFFReadNextScanLine.");

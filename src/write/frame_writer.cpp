@@ -4,11 +4,11 @@
 #include <algorithm>
 #include <limits>
 
+#include "frame/checked_size.h"
 #include "frame/codec_messages.h"
 #include "frame/host_memory.h"
 #include "frame/report.h"
 #include "frame/tiff_open.h"
-#include "metadata/metadata_writer.h"
 #include "osttiff/osttiff.h"
 #include "pivlo/pivlo.h"
 #include "write/page_setup.h"
@@ -70,11 +70,12 @@ extern "C" ZAN_API int zanFrameBufferToTIFF(ConversionContext* ctx) {
     const bool reduce = ctx->bitsPerSample == 16 && !sixteen;
     ColourLayout layout;
     ColourLayoutFor(space, ctx->frameWidth, sixteen, ctx->frameWhiteIsZero != 0, 0, &layout);
-    // The frame must hold every row (twice the bytes when reduced from 16 bits).
-    const uint64_t frameBytes = layout.rowBytes * ctx->frameHeight * (reduce ? 2 : 1);
     if (ctx->frameWidth == 0 || ctx->frameHeight == 0 || !ctx->frameData)
         return ReportError(ctx, "Image dimension can not be zero.");
-    if (frameBytes > std::numeric_limits<uint32_t>::max() ||
+    // The frame must hold every row (twice the bytes when reduced from 16
+    // bits), and a 32-bit size must be able to say so.
+    uint64_t frameBytes = 0;
+    if (!MultiplySizes(layout.rowBytes, ctx->frameHeight, reduce ? 2 : 1, &frameBytes) || !FitsIn32(frameBytes) ||
         (ctx->frameBufferSize != 0 && ctx->frameBufferSize < frameBytes))
         return ReportError(ctx, "Frame buffer too small for the frame described.");
 
@@ -96,8 +97,7 @@ extern "C" ZAN_API int zanFrameBufferToTIFF(ConversionContext* ctx) {
                                   static_cast<tmsize_t>(uint64_t{rows} * layout.rowBytes)) == -1)
             return FailWrite(ctx);
     }
-    if (!WritePageDirectory(ctx)) return FailWrite(ctx);
-    if (ctx->writeMetadataList) WriteTIFFMetadata(ctx);
+    if (!FinishPage(ctx)) return FailWrite(ctx);
     const bool failedWrite = TIFFIOFailedPivlo(tif) != 0;
     CloseJob(ctx);
     if (failedWrite) {

@@ -79,12 +79,17 @@ int ApplyPageMetadata(ConversionContext* ctx, TIFF* tif) {
     return 1;
 }
 
-bool WritePageDirectory(ConversionContext* ctx) {
-    if (!TIFFWriteDirectory(ctx->tiff)) return false;
-    if (TIFFIOFailedPivlo(ctx->tiff)) {
+bool FinishPage(ConversionContext* ctx) {
+    TIFF* tif = ctx->tiff;
+    // The EXIF link is set in place once the EXIF directory is written; the
+    // placeholder gives the page's directory its final size now.
+    if (HasExifEntries(ctx)) TIFFSetField(tif, TIFFTAG_EXIFIFD, uint64_t{0});
+    if (!TIFFWritePageDirectoryPivlo(tif)) return false;
+    if (TIFFIOFailedPivlo(tif)) {
         zanError(ctx, "Unable to write the page to the destination.");
         return false;
     }
+    WriteTIFFMetadata(ctx);
     return true;
 }
 
@@ -109,12 +114,13 @@ extern "C" ZAN_API int zanTIFFSetField(ConversionContext* ctx, uint32_t tag, ...
 extern "C" ZAN_API int zanTIFFNextImage(ConversionContext* ctx) {
     using namespace zan;
     if (!ctx) return 0;
-    if (!ctx->tiff) {
+    // Only a page that has taken lines can be ended: a second call in a row
+    // would write an empty directory that readers reject.
+    if (!ctx->tiff || ctx->state != ZAN_STATE_WRITING) {
         zanError(ctx, "No page is being written.");
         return 0;
     }
-    if (!WritePageDirectory(ctx)) return 0;
-    if (ctx->writeMetadataList) WriteTIFFMetadata(ctx);
+    if (!FinishPage(ctx)) return 0;
     ctx->state = ZAN_STATE_PAGE_CLOSED;
     return 1;
 }

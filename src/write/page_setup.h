@@ -13,9 +13,11 @@ namespace zan {
 // already holds are left alone. 1, or 0 after "Error in saving metadata".
 int ApplyPageMetadata(ConversionContext* ctx, TIFF* tif);
 
-// Writes the page's directory and checks that every byte reached the
-// destination. False when the codec failed (it has reported) or a write
-// came up short (reported here).
-bool WritePageDirectory(ConversionContext* ctx);
+// Ends the page being written: writes its directory, checks that every
+// byte reached the destination, then writes its EXIF directory from
+// writeMetadataList. False when the page's directory was not written (the
+// codec has reported, or a short write is reported here); a failure of the
+// EXIF directory is reported and leaves the page written.
+bool FinishPage(ConversionContext* ctx);
 
 }  // namespace zan

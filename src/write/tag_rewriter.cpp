@@ -54,6 +54,7 @@ public:
         }
         // A field that takes a count takes it with its values, however many.
         if (TIFFFieldPassCount(field)) return Result(TIFFSetField(tif_, tag, static_cast<int>(expected), value));
+        if (expected > 1 && IsOneValueForAllSamples(tag)) return SetFirstOfSamples(field, tag, value);
         if (expected > 1) return SetSeveral(field, tag, value);
         return SetOne(field, tag, value);
     }
@@ -108,6 +109,19 @@ private:
         }
         if (NeedsSeveralArrays(tag)) return Result(0);
         return Result(TIFFSetField(tif_, tag, value));
+    }
+
+    // A per-sample field that libtiff keeps as one value for every sample
+    // gets the first of the values given (an array of its element form).
+    EntryResult SetFirstOfSamples(const TIFFField* field, uint32_t tag, const void* value) {
+        if (TIFFFieldSetGetSize(field) == 8) {
+            double v;
+            std::memcpy(&v, value, sizeof v);
+            return Result(TIFFSetField(tif_, tag, v));
+        }
+        uint16_t v;
+        std::memcpy(&v, value, sizeof v);
+        return Result(TIFFSetField(tif_, tag, int{v}));
     }
 
     EntryResult SetOne(const TIFFField* field, uint32_t tag, const void* value) {

@@ -15,8 +15,9 @@ using namespace zantest;
 
 // Lines of TIFFPrintDirectory's text that hold offsets (they move) or the
 // fields extraction rewrites.
-const std::vector<std::string> kMovingLines = {"Directory at", "Subfile Type", "Page Number",
-                                               "EXIFIFD", "GPSIFD", "Tag 34665", "Tag 34853"};
+const std::vector<std::string> kMovingLines = {"Directory at", "Subfile Type",   "Page Number", "EXIFIFD",
+                                               "GPSIFD",       "Tag 34665",      "Tag 34853",   "JpegInterchangeFormat:",
+                                               "JpegQTables",  "JpegDcTables",   "JpegAcTables"};
 
 uint32_t CountPages(const Bytes& tiff) {
     uint32_t pages = 0;
@@ -25,11 +26,13 @@ uint32_t CountPages(const Bytes& tiff) {
 }
 
 // Refusals that a good file may meet, by what the walker does not take on:
-// BigTIFF, pages whose strip byte counts are missing, and in concatenation
-// IFD-typed and DOUBLE fields and wide samples that would change byte order.
+// BigTIFF, pages whose strip byte counts are missing, pages with SubIFDs,
+// and in concatenation IFD-typed fields it cannot relocate, DOUBLE values
+// and wide samples that would change byte order.
 bool AcceptableRefusal(const std::vector<std::string>& errors, bool concatenating) {
     static const std::vector<std::string> kAlways = {
-        "Error in second 2 bytes (TIFF id).\n", "Source page has strip offsets but no byte counts."};
+        "Error in second 2 bytes (TIFF id).\n", "Source page has strip offsets but no byte counts.",
+        "Pages with SubIFDs cannot be copied."};
     static const std::vector<std::string> kConcatenation = {
         "Unhandled TIFF TYPE.", "Unhandled type.",
         "Page samples of more than 8 bits cannot change byte order without decoding."};
@@ -40,14 +43,17 @@ bool AcceptableRefusal(const std::vector<std::string>& errors, bool concatenatin
     return in(kAlways) || (concatenating && in(kConcatenation));
 }
 
-void ExpectSamePage(const PageDump& want, const PageDump& got, const std::string& what) {
+// `orderChanged`: the page was copied into a file of the other byte order.
+void ExpectSamePage(const PageDump& want, const PageDump& got, const std::string& what, bool orderChanged = false) {
     ASSERT_TRUE(got.ok) << what;
     EXPECT_EQ(WithoutLines(got.tags, kMovingLines), WithoutLines(want.tags, kMovingLines)) << what;
     EXPECT_EQ(WithoutLines(got.exifTags, kMovingLines), WithoutLines(want.exifTags, kMovingLines)) << what;
-    // Old-style JPEG pages find their data through JPEGInterchangeFormat, an
-    // offset field the walker leaves as it is (a documented limit).
-    const bool oldJpeg = want.tags.find("Old-style JPEG") != std::string::npos;
-    if (want.dataComplete && !oldJpeg) {
+    // libtiff 4.5 decodes the strips after the first of a multi-strip
+    // old-style JPEG page differently in a big-endian file, although the
+    // structure and every byte of JPEG data are the same: only the tags are
+    // compared then.
+    const bool oldJpegSwapped = orderChanged && want.tags.find("Old-style JPEG") != std::string::npos;
+    if (want.dataComplete && !oldJpegSwapped) {
         EXPECT_EQ(got.data, want.data) << what;
     }
 }
@@ -105,7 +111,8 @@ TEST_F(CorpusPageOps, GoodFilesAppendToFilesOfEitherByteOrder) {
             const Bytes out = job.Dest();
             ASSERT_EQ(CountPages(out), pages + 1) << what;
             for (uint32_t p = 0; p < pages; ++p)
-                ExpectSamePage(DumpPage(source, p), DumpPage(out, p + 1), what + " page " + std::to_string(p + 1));
+                ExpectSamePage(DumpPage(source, p), DumpPage(out, p + 1), what + " page " + std::to_string(p + 1),
+                               bigEndian != (source[0] == 'M'));
             ++appended;
         }
     }

@@ -91,12 +91,13 @@ LibtiffPage ReadWithLibtiff(const std::string& path) {
 
 // The colour the host's line says pixel x has, as libtiff's RGBA would show
 // it (grey repeated, min-is-white inverted), or false for kinds libtiff
-// converts in ways the reader does not (alpha, CMYK, YCbCr raw, Lab, ...).
+// converts in ways the reader does not (alpha, CMYK, Lab, ...). YCbCr pages
+// come as RGB, as libtiff's RGBA shows them.
 bool LineColour(const ConversionContext* ctx, uint16_t photometric, const Bytes& line, uint32_t x,
                 uint32_t rgb[3]) {
     const uint32_t bits = ctx->bitsPerSample;
     if (photometric == PHOTOMETRIC_PALETTE || (photometric == PHOTOMETRIC_RGB && bits != 1) ||
-        (ctx->compression == ZAN_COMPRESSION_JPEG && photometric == PHOTOMETRIC_YCBCR)) {
+        photometric == PHOTOMETRIC_YCBCR) {
         for (uint32_t c = 0; c < 3; ++c) rgb[c] = line[ctx->planarConfig == 2 ? c * ctx->imageWidth + x : x * 3 + c];
         return true;
     }

@@ -90,16 +90,12 @@ OSTTIFF_API int TIFFGetStrileByteCount32(TIFF* tif, uint32_t strile, uint32_t* b
 OSTTIFF_API int TIFFFieldInfoPivlo(TIFF* tif, uint32_t tag, TIFFFieldInfo* info);
 
 /* ---- directory as stored ----
- * libtiff completes some fields that a directory does not hold (it invents
- * ExtraSamples for surplus samples). These answer from the current
- * directory's entries in the file: 1 when the tag is present, 0 when absent,
- * -1 when the entries cannot be read again (a stream source that has
- * released them). */
-OSTTIFF_API int TIFFDirectoryHasTagPivlo(TIFF* tif, uint32_t tag);
-
-/* ExtraSamples as the current directory stores it: the count and values
- * when the tag is present, count 0 when it is absent. When the directory
- * cannot be read again, libtiff's own answer is given. 1 on success. */
+ * libtiff completes ExtraSamples when a directory holds more samples than
+ * its colour channels and ExtraSamples account for (it warns, and counts the
+ * surplus as unspecified extra samples). This gives the count and values the
+ * current directory stores itself (count 0 when it has no ExtraSamples), for
+ * every kind of source: the completion is noted while libtiff reads the
+ * directory. 1 on success. */
 OSTTIFF_API int TIFFGetStoredExtraSamplesPivlo(TIFF* tif, uint16_t* count, const uint16_t** values);
 
 /* ---- EXIF directories ----
@@ -126,6 +122,24 @@ OSTTIFF_API int TIFFWriteEXIFDirectoryPivlo(TIFF* tif);
 /* Offset of the EXIF directory written last through this object; 0 when
  * none was written. */
 OSTTIFF_API uint64_t TIFFLastEXIFOffsetPivlo(TIFF* tif);
+
+/* ---- pages written ----
+ * TIFFWritePageDirectoryPivlo writes the current directory as the next page
+ * (TIFFWriteDirectory) and remembers where it went, so that the page can be
+ * reached again without walking the chain (a walk for every page makes
+ * writing many pages quadratic). Classic TIFF; 1 or 0. */
+OSTTIFF_API int TIFFWritePageDirectoryPivlo(TIFF* tif);
+
+/* Offset of the page written last by TIFFWritePageDirectoryPivlo; 0 when
+ * none, or when it could not be learnt. */
+OSTTIFF_API uint64_t TIFFLastPageOffsetPivlo(TIFF* tif);
+
+/* Sets the ExifIFD entry of the page written last, which must hold one (a
+ * placeholder 0 set before the page was written), to `exifOffset` in place.
+ * Offset 0 takes the entry out instead: the directory keeps its place and
+ * holds one entry fewer. 1, or 0 when the page or the entry cannot be
+ * reached. */
+OSTTIFF_API int TIFFSetLastPageEXIFPivlo(TIFF* tif, uint64_t exifOffset);
 
 /* ---- writing helpers ---- */
 

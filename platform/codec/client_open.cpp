@@ -219,6 +219,10 @@ int TIFFIOFailedPivlo(TIFF* tif) {
     return a ? a->ioFailed : 0;
 }
 
+void TIFFClearIOFailedPivlo(TIFF* tif) {
+    if (Adapter* a = AdapterOfTiff(tif)) a->ioFailed = 0;
+}
+
 int TIFFGetStrileOffset32(TIFF* tif, uint32_t strile, uint32_t* offset) {
     int err = 0;
     const uint64_t value = TIFFGetStrileOffsetWithErr(tif, strile, &err);

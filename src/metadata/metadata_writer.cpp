@@ -79,7 +79,11 @@ int WriteTIFFMetadata(ConversionContext* ctx) {
     TIFFCreateDirectory(tif);
     zanEndTiffEXIFDir(tif);
     if (!created || !anything || !written) {
+        // The page goes without an EXIF link; a directory that failed to be
+        // written is linked from nowhere, so its failure is the EXIF
+        // directory's alone.
         const bool unlinked = TIFFSetLastPageEXIFPivlo(tif, 0) != 0;
+        if (unlinked) TIFFClearIOFailedPivlo(tif);
         if (!created) return ReportError(ctx, "Cannot create EXIF entry in the TIFF directory");
         if (anything) return ReportError(ctx, "TIFF EXIF write error");
         if (!unlinked) return ReportError(ctx, "Cannot create EXIF entry in the TIFF directory");

@@ -357,7 +357,7 @@ bool ReadRgbaBand(ConversionContext* ctx, uint32_t top) {
     image.row_offset = static_cast<int>(top);
     image.col_offset = 0;
     const uint32_t rows = std::min(ctx->rowsPerStrip, ctx->imageHeight - top);
-    const int got = TIFFRGBAImageGet(&image, reinterpret_cast<uint32_t*>(ctx->stripBuffer), ctx->imageWidth, rows);
+    const int got = TIFFRGBAImageGetPivlo(&image, reinterpret_cast<uint32_t*>(ctx->stripBuffer), ctx->imageWidth, rows);
     TIFFRGBAImageEnd(&image);
     return got != 0;
 }

@@ -201,6 +201,8 @@ public:
         return std::all_of(fixed_.end() - kGuard, fixed_.end(), [](uint8_t b) { return b == kGuardByte; });
     }
     MemoryStream& stream() { return stream_; }
+    // Puts `bytes` at the start of the fixed buffer, as a file already there.
+    void Preload(const Bytes& bytes) { std::copy(bytes.begin(), bytes.end(), fixed_.begin()); }
     void* block() const { return block_; }
     void Forget() { block_ = nullptr; }
     uint32_t size() const { return size_; }
@@ -320,12 +322,15 @@ TEST(ReadingOpen, SourceThatCannotBeOpenedIsRefusedAndNothingIsHeld) {
 // ---------------------------------------------------------------- writing
 
 TEST(WritingOpen, AppendModeAddsPagesToAnExistingFile) {
-    for (DestKind kind : {DestKind::FileReopened, DestKind::Callbacks}) {
+    // A fixed buffer's file ends where its structure says, not where the
+    // buffer does.
+    for (DestKind kind : {DestKind::FileReopened, DestKind::Callbacks, DestKind::FixedBuffer}) {
         SCOPED_TRACE(kDestNames[static_cast<int>(kind)]);
         TestHost host;
         DestinationFixture dest(host, kind);
         const Bytes first = MakePages(1);
         if (kind == DestKind::Callbacks) dest.stream().data = first;
+        else if (kind == DestKind::FixedBuffer) dest.Preload(first);
         else WriteFileBytes(dest.file().path(), first);
         host->appendPages = 1;
         ASSERT_EQ(OpenTIFFForWriting(host.ctx()), 1);
@@ -371,6 +376,8 @@ TEST(WritingOpen, DestinationThatCannotBeOpenedIsRefusedWithItsReason) {
          }},
         {DestKind::Callbacks, "Destination function is supported only when seek function is provided",
          [](TestHost& host) { host->destSeekProc = nullptr; }},
+        {DestKind::FixedBuffer, "The destination buffer holds no TIFF to add a page to.",
+         [](TestHost& host) { host->appendPages = 1; }},
         {DestKind::FileAsIs, "Memory allocation", [](TestHost&) { TestAllocator::FailNthCall(1); }},
         {DestKind::GrowingMemory, "Memory allocation", [](TestHost&) { TestAllocator::FailNthCall(1); }},
         {DestKind::GrowingMemory, "Unable to create TIFF object",

@@ -29,6 +29,88 @@ TEST(Concatenate, AppendsBigEndianPagesToALittleEndianFileInItsOrder) {
     EXPECT_NE(second.tags.find("Resolution: 300"), std::string::npos);
 }
 
+TEST(Concatenate, PointersOfTypeIfdAndFieldsStoredAsLongChangeByteOrder) {
+    // libtiff writes the ExifIFD pointer as type IFD: the EXIF directory is
+    // relocated and converted like the page's own.
+    const Bytes exif = MakeExifTiff();
+    FileJob withExif(exif, BuildTiff({GreyPage(3, 3, 3)}, {.bigEndian = true}));
+    ASSERT_EQ(withExif.Concatenate(), 1) << ::testing::PrintToString(withExif.Errors());
+    const PageDump copied = DumpPage(withExif.Dest(), 1), original = DumpPage(exif, 0);
+    EXPECT_FALSE(original.exifTags.empty());
+    EXPECT_EQ(WithoutLines(copied.exifTags, {"Directory at"}), WithoutLines(original.exifTags, {"Directory at"}));
+    EXPECT_EQ(copied.data, original.data);
+
+    // Compression and BitsPerSample as LONG: 16-bit samples of an
+    // uncompressed page are swapped, a compressed page with them refused.
+    auto sixteenBit = [](uint32_t compression) {
+        BuiltPage page;
+        page.entries = {LongEntry(256, {3}), LongEntry(257, {2}), LongEntry(258, {16}), LongEntry(259, {compression}),
+                        ShortEntry(262, {1}), ShortEntry(277, {1}), LongEntry(278, {2})};
+        page.strips = {Bytes{0x12, 0x34, 0x56, 0x78, 0x9A, 0xBC, 0xDE, 0xF0, 0x01, 0x02, 0x03, 0x04}};
+        return BuildTiff({page}, {.bigEndian = true});
+    };
+    FileJob swapped(sixteenBit(COMPRESSION_NONE), BuildTiff({GreyPage(3, 3, 3)}));
+    ASSERT_EQ(swapped.Concatenate(), 1) << ::testing::PrintToString(swapped.Errors());
+    EXPECT_EQ(DecodeWithLibtiff(swapped.Dest())[1].pixels, DecodeWithLibtiff(sixteenBit(COMPRESSION_NONE))[0].pixels);
+    FileJob refused(sixteenBit(COMPRESSION_LZW), BuildTiff({GreyPage(3, 3, 3)}));
+    EXPECT_EQ(refused.Concatenate(), 0);
+    EXPECT_EQ(refused.Errors(),
+              std::vector<std::string>{"Page samples of more than 8 bits cannot change byte order without decoding."});
+}
+
+#if defined(__GLIBC__)
+// A destination stream that records where its writes land, in order.
+struct RecordingFile {
+    FILE* file;
+    int64_t position = 0;
+    std::vector<std::pair<int64_t, size_t>> writes;
+    static ssize_t Write(void* cookie, const char* data, size_t n) {
+        auto* r = static_cast<RecordingFile*>(cookie);
+        r->writes.emplace_back(r->position, n);
+        std::fseek(r->file, r->position, SEEK_SET);
+        const size_t done = std::fwrite(data, 1, n, r->file);
+        r->position += static_cast<int64_t>(done);
+        return static_cast<ssize_t>(done);
+    }
+    static ssize_t Read(void* cookie, char* data, size_t n) {
+        auto* r = static_cast<RecordingFile*>(cookie);
+        std::fseek(r->file, r->position, SEEK_SET);
+        const size_t done = std::fread(data, 1, n, r->file);
+        r->position += static_cast<int64_t>(done);
+        return static_cast<ssize_t>(done);
+    }
+    static int Seek(void* cookie, off64_t* offset, int whence) {
+        auto* r = static_cast<RecordingFile*>(cookie);
+        std::fseek(r->file, 0, SEEK_END);
+        const int64_t end = std::ftell(r->file);
+        r->position = whence == SEEK_SET ? *offset : whence == SEEK_CUR ? r->position + *offset : end + *offset;
+        *offset = r->position;
+        return 0;
+    }
+};
+
+TEST(Concatenate, PagesAreLinkedOnlyOnceWrittenWhole) {
+    // The destination never points at a page that is not all there: the
+    // link to each appended page is the last thing written for it.
+    const Bytes dest = BuildTiff({GreyPage(3, 3, 3)});
+    FileJob job(BuildTiff({GreyPage(40, 30, 5)}), dest);
+    RecordingFile recording{job.host()->destFp};
+    cookie_io_functions_t io{RecordingFile::Read, RecordingFile::Write, RecordingFile::Seek, nullptr};
+    FILE* recorded = fopencookie(&recording, "r+", io);
+    job.host()->destFp = recorded;
+    ASSERT_EQ(job.Concatenate(), 1) << ::testing::PrintToString(job.Errors());
+    std::fclose(recorded);
+    job.host()->destFp = recording.file;
+    const auto dirs = DirectoryOffsets(job.Dest());
+    ASSERT_EQ(dirs.size(), 2u);
+    const int64_t link = dirs[0] + 2 + 12 * Get16(dest, dirs[0]);
+    ASSERT_FALSE(recording.writes.empty());
+    EXPECT_EQ(recording.writes.back(), (std::pair<int64_t, size_t>{link, 4}));
+    for (size_t i = 0; i + 1 < recording.writes.size(); ++i)
+        EXPECT_NE(recording.writes[i].first, link) << "write " << i << " of " << recording.writes.size();
+}
+#endif
+
 TEST(Concatenate, FileAppendedToACopyOfItselfDoublesItsPages) {
     const Bytes file = BuildTiff({GreyPage(4, 4, 2), GreyPage(3, 3, 3)});
     FileJob job(file, file);

@@ -81,6 +81,23 @@ Bytes WithStripTags(std::vector<RawEntry> entries, bool keepOwn = false) {
     return BuildTiff({page});
 }
 
+// Little-endian numbers for building structures by hand.
+void Put16Le(Bytes& b, size_t at, uint16_t v) {
+    b[at] = static_cast<uint8_t>(v);
+    b[at + 1] = static_cast<uint8_t>(v >> 8);
+}
+void Put32Le(Bytes& b, size_t at, uint32_t v) {
+    for (int i = 0; i < 4; ++i) b[at + i] = static_cast<uint8_t>(v >> (8 * i));
+}
+
+// A page with `n` ExifIFD entries, each pointing at its own empty directory
+// (zero bytes of the leading padding read as such).
+Bytes ManyExifDirectories(uint32_t n) {
+    BuiltPage page = GreyPage(4, 2, 2);
+    for (uint32_t i = 0; i < n; ++i) page.entries.push_back(LongEntry(34665, {8 + 6 * i}));
+    return BuildTiff({page}, {.leadingPadding = 6 * n + 8});
+}
+
 TEST(PageCopy, RefusesPagesItCannotRelocateAndWritesNoPage) {
     Bytes farValue = BuildTiff({GreyPage(4, 2, 2)});
     FoundEntry e;
@@ -105,6 +122,13 @@ TEST(PageCopy, RefusesPagesItCannotRelocateAndWritesNoPage) {
          "Source strip data lie beyond the end of the file."},
         {farValue, "Source value lies beyond the end of the file."},
         {brokenChain, "Source directory chain is damaged.", 0},
+        // Offsets the copy cannot relocate would point into the wrong place.
+        {WithStripTags({LongEntry(330, {8})}, true), "Pages with SubIFDs cannot be copied."},
+        {WithStripTags({LongEntry(519, {8})}, true),
+         "Old-style JPEG tables outside the JPEG interchange data cannot be copied."},
+        {WithStripTags({LongEntry(513, {8}), LongEntry(514, {4}), LongEntry(520, {40})}, true),
+         "Old-style JPEG tables outside the JPEG interchange data cannot be copied."},
+        {ManyExifDirectories(65), "Source page has too many EXIF, GPS or Interoperability directories."},
     };
     for (const Case& c : cases) {
         FileJob job(c.source, {});
@@ -112,6 +136,61 @@ TEST(PageCopy, RefusesPagesItCannotRelocateAndWritesNoPage) {
         EXPECT_EQ(job.Errors(), std::vector<std::string>{c.message});
         EXPECT_EQ(job.Dest().size(), c.written) << c.message;
     }
+}
+
+TEST(PageCopy, SubDirectoriesPointedAtManyTimesAreCopiedOnce) {
+    // 30 ExifIFD entries point at one EXIF directory, whose 30 Interop
+    // entries point at one Interoperability directory holding 2 KiB: copied
+    // once each, the page stays the size it is (900 copies of the 2 KiB
+    // before).
+    Bytes padding(2 + 12 + 4 + 2 + (2 + 12 * 30 + 4) + 2048, 0);
+    const uint32_t interop = 8, exif = 28, value = exif + 2 + 12 * 30 + 4;
+    Put16Le(padding, interop - 8, 1);
+    Put16Le(padding, interop - 8 + 2, 1);  // InteroperabilityIndex
+    Put16Le(padding, interop - 8 + 4, 7);  // UNDEFINED
+    Put32Le(padding, interop - 8 + 6, 2048);
+    Put32Le(padding, interop - 8 + 10, value);
+    Put16Le(padding, exif - 8, 30);
+    for (uint32_t i = 0; i < 30; ++i) {
+        const size_t at = exif - 8 + 2 + 12 * i;
+        Put16Le(padding, at, 40965);
+        Put16Le(padding, at + 2, 4);
+        Put32Le(padding, at + 4, 1);
+        Put32Le(padding, at + 8, interop);
+    }
+    BuiltPage page = GreyPage(4, 2, 2);
+    for (int i = 0; i < 30; ++i) page.entries.push_back(LongEntry(34665, {exif}));
+    Bytes source = BuildTiff({page}, {.leadingPadding = static_cast<uint32_t>(padding.size())});
+    std::copy(padding.begin(), padding.end(), source.begin() + 8);
+    const Bytes out = ExtractFirst(source);
+    ASSERT_FALSE(out.empty());
+    EXPECT_LT(out.size(), source.size());
+    EXPECT_EQ(DecodeWithLibtiff(out)[0].pixels, DecodeWithLibtiff(source)[0].pixels);
+}
+
+TEST(PageCopy, OldStyleJpegDataMovesWithItsTables) {
+    // JPEGInterchangeFormat's block is copied whole, and the table offsets
+    // that point into it move with it.
+    Bytes block(64);
+    for (size_t i = 0; i < block.size(); ++i) block[i] = static_cast<uint8_t>(200 - i);
+    BuiltPage page = GreyPage(4, 2, 2);
+    page.entries.push_back(LongEntry(513, {8}));
+    page.entries.push_back(LongEntry(514, {64}));
+    page.entries.push_back(LongEntry(519, {8, 24, 40}));
+    page.entries.push_back(LongEntry(520, {56}));
+    Bytes source = BuildTiff({page}, {.leadingPadding = 64 + 100});
+    std::copy(block.begin(), block.end(), source.begin() + 8);
+    const Bytes out = ExtractFirst(source);
+    ASSERT_FALSE(out.empty());
+    FoundEntry jpeg, tables, dc;
+    ASSERT_TRUE(FindEntry(out, 8, 513, &jpeg) && FindEntry(out, 8, 519, &tables) && FindEntry(out, 8, 520, &dc));
+    const uint32_t at = Get32(out, jpeg.valueField);
+    EXPECT_EQ(Bytes(out.begin() + at, out.begin() + at + 64), block);
+    const uint32_t array = Get32(out, tables.valueField);
+    EXPECT_EQ(Get32(out, array), at);
+    EXPECT_EQ(Get32(out, array + 8), at + 32);
+    EXPECT_EQ(Get32(out, dc.valueField), at + 48) << "one table: inline";
+    EXPECT_LT(out.size(), source.size()) << "the padding around the block is not copied";
 }
 
 // A page whose strips libtiff wrote last first: descending offsets, odd

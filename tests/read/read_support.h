@@ -57,6 +57,7 @@ public:
 
     TestHost& host() { return host_; }
     ConversionContext* operator->() { return host_.ctx(); }
+    const std::string& path() const { return file_.path(); }
 
 private:
     Bytes bytes_;

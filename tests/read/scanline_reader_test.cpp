@@ -9,7 +9,11 @@
 
 #include <tiffio.h>
 
+#include <unistd.h>
+
 #include "read_support.h"
+#include "support/corpus.h"
+#include "support/tiff_builder.h"
 
 namespace {
 
@@ -128,7 +132,7 @@ TEST(ScanlineReader, RowsOfEachPageKindFromEverySource) {
         {"anything but 16 delivers 8 bits", rgb(16), 0, highBytes},
         {"2-bit grey", Page(11, 8, 1, PHOTOMETRIC_MINISBLACK, 2), 0, widened},
         {"4-bit grey", Page(11, 8, 1, PHOTOMETRIC_MINISBLACK, 4), 0, widened},
-        {"five inks are no extra samples", Page(3, 2, 5, PHOTOMETRIC_SEPARATED), 0, asStored, false},
+        {"five inks are no extra samples", Page(3, 2, 5, PHOTOMETRIC_SEPARATED), 0, asStored},
         {"separate planes one after another", rgb(8, COMPRESSION_NONE, PLANARCONFIG_SEPARATE), 0, planeByPlane, false},
         {"tiles", Tiled(Page(40, 37, 3, PHOTOMETRIC_RGB)), 0, asStored},
         {"tiles of separate planes",
@@ -136,8 +140,7 @@ TEST(ScanlineReader, RowsOfEachPageKindFromEverySource) {
         {"bilevel Group 4, packed", Page(20, 8, 1, PHOTOMETRIC_MINISWHITE, 1, COMPRESSION_CCITTFAX4), 0, packed},
     };
     // A stream buffer source is read once and forward only: the planes of a
-    // page cannot be gone back to, and extra samples are libtiff's reckoning
-    // (a fifth ink counts as one).
+    // page cannot be gone back to.
     for (const Case& c : cases)
         for (Source source : {Source::Memory, Source::File, Source::Callbacks, Source::StreamBuffer}) {
             if (source == Source::StreamBuffer && !c.streamBufferToo) continue;
@@ -180,19 +183,23 @@ TEST(ScanlineReader, PaletteEntriesAreScaledOnlyWhenWide) {
 
 TEST(ScanlineReader, AlphaIsDividedOutAndExtraSamplesDroppedOnRequest) {
     // A fourth sample counts as alpha whether ExtraSamples calls it
-    // associated alpha or the page has no ExtraSamples tag at all.
+    // associated alpha or the page has no ExtraSamples tag at all, from a
+    // source read once (where the directory cannot be looked at again) as
+    // from any other.
     for (bool tagged : {true, false})
-        for (uint32_t drop : {0u, 1u}) {
-            SCOPED_TRACE(::testing::Message() << (tagged ? "tagged" : "untagged") << ", drop " << drop);
+        for (uint32_t drop : {0u, 1u})
+        for (Source source : {Source::Memory, Source::StreamBuffer}) {
+            SCOPED_TRACE(::testing::Message() << (tagged ? "tagged" : "untagged") << ", drop " << drop
+                                              << ", source " << static_cast<int>(source));
             PageSpec p = Page(4, 2, 4, PHOTOMETRIC_RGB);
             if (tagged) p.extraSamples = {EXTRASAMPLE_ASSOCALPHA};
-            ReadJob described(OnePage(p));
+            ReadJob described(OnePage(p), source);
             described->dropExtraSamples = drop;
             ASSERT_EQ(described.GetInfo(), 1);
             EXPECT_EQ(described->samplesPerPixel, drop ? 3u : 4u);
             EXPECT_EQ(described->extraSamples, drop ? 0u : 1u);
             EXPECT_EQ(described->imageType, static_cast<uint32_t>(ZAN_IMAGE_RGB));
-            ReadJob job(OnePage(p));
+            ReadJob job(OnePage(p), source);
             job->dropExtraSamples = drop;
             const auto rows = job.ReadAll();
             EXPECT_EQ(job->alphaSampleIndex, 3u);
@@ -215,6 +222,102 @@ TEST(ScanlineReader, PageNumberIsHonouredWithoutGetInfo) {
     const auto rows = job.ReadAll();
     ASSERT_EQ(rows.size(), 8u);
     EXPECT_EQ(rows[0].size(), 7u);
+}
+
+// An uncompressed or LZW YCbCr page written by libtiff with `subsampling`,
+// in tiles or strips; its stored blocks hold a smooth pattern.
+Bytes YCbCrPage(uint16_t subsampling, bool tiled, uint16_t compression = COMPRESSION_NONE) {
+    TempFile file;
+    TIFF* tif = TIFFOpen(file.c_str(), "w");
+    TIFFSetField(tif, TIFFTAG_IMAGEWIDTH, 37);
+    TIFFSetField(tif, TIFFTAG_IMAGELENGTH, 21);
+    TIFFSetField(tif, TIFFTAG_BITSPERSAMPLE, 8);
+    TIFFSetField(tif, TIFFTAG_SAMPLESPERPIXEL, 3);
+    TIFFSetField(tif, TIFFTAG_PHOTOMETRIC, PHOTOMETRIC_YCBCR);
+    TIFFSetField(tif, TIFFTAG_COMPRESSION, compression);
+    TIFFSetField(tif, TIFFTAG_YCBCRSUBSAMPLING, subsampling >> 4, subsampling & 15);
+    if (tiled) {
+        TIFFSetField(tif, TIFFTAG_TILEWIDTH, 16);
+        TIFFSetField(tif, TIFFTAG_TILELENGTH, 16);
+    } else {
+        TIFFSetField(tif, TIFFTAG_ROWSPERSTRIP, 8);
+    }
+    // Blocks of h x v luma samples and their two chroma samples.
+    const uint32_t h = subsampling >> 4, v = subsampling & 15;
+    const uint32_t width = tiled ? 16 : 37, rows = tiled ? 16 : 8;
+    const auto size = static_cast<tmsize_t>((width + h - 1) / h * ((rows + v - 1) / v) * (h * v + 2));
+    const uint32_t blocks = tiled ? TIFFNumberOfTiles(tif) : TIFFNumberOfStrips(tif);
+    for (uint32_t b = 0; b < blocks; ++b) {
+        Bytes data(static_cast<size_t>(size));
+        for (size_t i = 0; i < data.size(); ++i) data[i] = static_cast<uint8_t>(96 + (i * 7 + b * 13) % 64);
+        if (tiled) TIFFWriteEncodedTile(tif, b, data.data(), size);
+        else TIFFWriteEncodedStrip(tif, b, data.data(), size);
+    }
+    TIFFClose(tif);
+    return ReadFileBytes(file.path());
+}
+
+// libtiff's RGBA decode of the first page, top row first, as RGB rows.
+std::vector<Bytes> LibtiffRgbRows(const Bytes& tiff) {
+    TempFile file;
+    WriteFileBytes(file.path(), tiff);
+    TIFF* tif = TIFFOpen(file.c_str(), "r");
+    uint32_t width = 0, height = 0;
+    TIFFGetField(tif, TIFFTAG_IMAGEWIDTH, &width);
+    TIFFGetField(tif, TIFFTAG_IMAGELENGTH, &height);
+    std::vector<uint32_t> raster(static_cast<size_t>(width) * height);
+    std::vector<Bytes> rows;
+    if (TIFFReadRGBAImageOriented(tif, width, height, raster.data(), ORIENTATION_TOPLEFT, 0))
+        for (uint32_t y = 0; y < height; ++y) {
+            Bytes row;
+            for (uint32_t x = 0; x < width; ++x) {
+                const uint32_t v = raster[static_cast<size_t>(y) * width + x];
+                row.insert(row.end(), {static_cast<uint8_t>(TIFFGetR(v)), static_cast<uint8_t>(TIFFGetG(v)),
+                                       static_cast<uint8_t>(TIFFGetB(v))});
+            }
+            rows.push_back(row);
+        }
+    TIFFClose(tif);
+    return rows;
+}
+
+TEST(ScanlineReader, YCbCrPagesOtherThanJpegComeAsRgb) {
+    // Subsampled blocks in tiles and strips, and old-style JPEG pages (one
+    // strip, several strips) of the corpus: every line as libtiff's RGBA
+    // decode shows it, and nothing read beyond a buffer.
+    std::vector<std::pair<std::string, Bytes>> pages = {
+        {"tiles, 2x2", YCbCrPage(0x22, true)},
+        {"strips, 2x1, LZW", YCbCrPage(0x21, false, COMPRESSION_LZW)},
+        {"strips, 1x1", YCbCrPage(0x11, false)},
+    };
+    if (!CorpusDir().empty())
+        for (const char* name : {"pillow/old-style-jpeg-compression.tif", "libtiff/ojpeg_chewey_subsamp21_multi_strip.tiff"})
+            pages.emplace_back(name, ReadFileBytes(CorpusDir() + "/" + name));
+    for (const auto& [what, tiff] : pages) {
+        SCOPED_TRACE(what);
+        const auto want = LibtiffRgbRows(tiff);
+        ASSERT_FALSE(want.empty());
+        ReadJob job(tiff);
+        const auto rows = job.ReadAll();
+        EXPECT_EQ(job->lineBytes, job->imageWidth * 3);
+        EXPECT_EQ(rows, want) << ::testing::PrintToString(job.host().Errors()) ;
+    }
+}
+
+TEST(ScanlineReader, FileTruncatedWhileReadingGivesAReadError) {
+    // The file is read through its stream, so the host that truncates it
+    // meets a failed read, not a fault.
+    PageSpec p = Page(64, 64, 3, PHOTOMETRIC_RGB);
+    p.rowsPerStrip = 1;
+    ReadJob job(OnePage(p), Source::File);
+    ASSERT_EQ(job.GetInfo(), 1);
+    Bytes line(1024);
+    ASSERT_GT(zanTIFFReadNextScanLine(job.host().ctx(), line.data(), 1024), 0u);
+    ASSERT_EQ(truncate(job.path().c_str(), 256), 0);
+    uint32_t delivered = 1;
+    while (delivered < 64 && zanTIFFReadNextScanLine(job.host().ctx(), line.data(), 1024) > 0) ++delivered;
+    EXPECT_LT(delivered, 64u);
+    EXPECT_TRUE(!job.host().Errors().empty() || !job.host().codecErrors.empty());
 }
 
 TEST(ScanlineReaderStates, RefusalsAndTheEndOfThePage) {
@@ -241,6 +344,17 @@ TEST(ScanlineReaderStates, RefusalsAndTheEndOfThePage) {
                                                               "Not enough space in line buffer."}));
 }
 
+// A Deflate page of `width` x `height` pixels whose single strip holds
+// `stripBytes` bytes of no meaning.
+Bytes HugePage(uint32_t width, uint32_t height, uint16_t samples, uint16_t bits, uint32_t stripBytes) {
+    BuiltPage page;
+    page.entries = {LongEntry(256, {width}), LongEntry(257, {height}), ShortEntry(258, std::vector<uint16_t>(samples, bits)),
+                    ShortEntry(259, {COMPRESSION_ADOBE_DEFLATE}), ShortEntry(262, {PHOTOMETRIC_MINISBLACK}),
+                    ShortEntry(277, {samples}), LongEntry(278, {height})};
+    page.strips = {Bytes(stripBytes, 0x55)};
+    return BuildTiff({page});
+}
+
 TEST(ScanlineReaderStates, PagesItCannotTakeAreRefusedWithTheirMessages) {
     PageSpec palette16 = Page(16, 8, 1, PHOTOMETRIC_PALETTE, 16);
     palette16.colorMap.assign(3 * 65536, 0);
@@ -259,6 +373,11 @@ TEST(ScanlineReaderStates, PagesItCannotTakeAreRefusedWithTheirMessages) {
          "Only supports 2, 4(palette), 2, 4, 8, 16 or 1 bitspersample."},
         {OnePage(palette16), 0, true, "Only supports 2 or 4 or 8 bit per sample palette tiff."},
         {OnePage(fourSamplePalette), 0, false, "Palette tiff with more than one sample per pixel not supported."},
+        // A tiny file that claims 4 GiB of pixels, and one whose line of
+        // two 4-bit samples a pixel widens to more than 4 GiB.
+        {HugePage(65535, 65535, 1, 8, 64), 0, false, "The page's data is too small for the image it describes."},
+        {HugePage(0x80000001u, 1, 2, 4, 2100000), 0, false, "A line of the page is larger than 4 GiB."},
+        {YCbCrPage(0x14, false), 0, true, "Unable to convert the page's YCbCr samples to RGB."},
     };
     for (const Case& c : cases) {
         SCOPED_TRACE(c.message);
@@ -276,6 +395,30 @@ TEST(ScanlineReaderStates, PagesItCannotTakeAreRefusedWithTheirMessages) {
             EXPECT_EQ(job->state, static_cast<uint32_t>(ZAN_STATE_DESCRIBED));
         }
     }
+}
+
+TEST(ScanlineReaderStates, FailedDescriptionEndsTheJob) {
+    // A page asked for while another is being read, and one that does not
+    // exist: the job is closed and idle, and a read starts afresh.
+    ReadJob job(TwoPagesSecondSevenWide());
+    Bytes line(64);
+    ASSERT_GT(zanTIFFReadNextScanLine(job.host().ctx(), line.data(), 64), 0u);
+    job->pageNumber = 3;
+    EXPECT_EQ(job.GetInfo(), 0);
+    EXPECT_EQ(job->state, static_cast<uint32_t>(ZAN_STATE_IDLE));
+    EXPECT_EQ(job->tiff, nullptr);
+    EXPECT_EQ(job->stripBuffer, nullptr);
+    EXPECT_EQ(zanTIFFReadNextScanLine(job.host().ctx(), line.data(), 64), 0u);
+    EXPECT_EQ(job.host().Errors(),
+              (std::vector<std::string>{"Unable to access target page.", "Unable to access target page."}));
+    job->pageNumber = 2;
+    EXPECT_EQ(zanTIFFReadNextScanLine(job.host().ctx(), line.data(), 64), 7u) << "a read opens the page again";
+    // A job that writes pages has no page to describe.
+    ReadJob writing(TwoPagesSecondSevenWide());
+    writing->state = ZAN_STATE_WRITING;
+    EXPECT_EQ(writing.GetInfo(), 0);
+    EXPECT_EQ(writing.host().Errors(), std::vector<std::string>{"Can not read while writing."});
+    writing->state = ZAN_STATE_IDLE;
 }
 
 TEST(ScanlineReaderStates, EveryAllocationOfDescriptionAndSetUpCanFail) {

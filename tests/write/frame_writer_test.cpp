@@ -112,10 +112,18 @@ TEST(FrameWriter, RefusalsAndTheirMessages) {
         EXPECT_EQ(job.host().Errors(), std::vector<std::string>{c.message});
         EXPECT_EQ(job->tiff, nullptr) << "nothing is opened";
     }
+    // A frame smaller than it says, and one whose size does not fit in 64
+    // bits (and wrapped to a small one before).
     FrameJob small(8, 10, 10, 30);
     small->frameBufferSize = 200;
-    EXPECT_EQ(small.Write(), 0);
-    EXPECT_EQ(small.host().Errors(), std::vector<std::string>{"Frame buffer too small for the frame described."});
+    FrameJob absurd(8, 4, 4, 16);
+    absurd->frameWidth = absurd->frameHeight = 0xFFFFFFFFu;
+    absurd->bitsPerSample = 16;
+    absurd->frameBufferSize = 0;
+    for (FrameJob* job : {&small, &absurd}) {
+        EXPECT_EQ(job->Write(), 0);
+        EXPECT_EQ(job->host().Errors(), std::vector<std::string>{"Frame buffer too small for the frame described."});
+    }
 }
 
 TEST(FrameWriter, FailedShrinkHandsOverTheWholeBlock) {

@@ -126,6 +126,126 @@ TEST(MultiPage, EveryDestinationKindGivesTheSameFileWithEachPagesExif) {
     }
 }
 
+TEST(MultiPage, NextImageEndsOnlyAPageBeingWritten) {
+    // A second call in a row has no page to end (it would write an empty
+    // directory that readers reject).
+    WriteJob job;
+    job.Describe(2, 6, 3, 1);
+    ASSERT_TRUE(job.WriteRows(PatternRows(3, 6)));
+    EXPECT_EQ(zanTIFFNextImage(job.host().ctx()), 1);
+    EXPECT_EQ(zanTIFFNextImage(job.host().ctx()), 0);
+    EXPECT_EQ(job.host().Errors(), std::vector<std::string>{"No page is being written."});
+    job.Describe(2, 9, 3, 1);
+    ASSERT_TRUE(job.WriteRows(PatternRows(3, 9)));
+    const auto pages = DecodeWithLibtiff(job.Finish());
+    ASSERT_EQ(pages.size(), 2u);
+    EXPECT_EQ(pages[1].width, 9u);
+}
+
+// A callback destination whose write of an EXIF directory holding FNumber
+// alone (one entry, tag 33437) fails, once.
+struct ExifFailingStream : MemoryStream {
+    bool failed = false;
+    static int32_t Write(const void* buffer, int32_t n, void* user) {
+        auto* s = static_cast<ExifFailingStream*>(user);
+        const auto* b = static_cast<const uint8_t*>(buffer);
+        if (!s->failed && n == 18 && b[0] == 1 && b[1] == 0 && b[2] == 0x9D && b[3] == 0x82) {
+            s->failed = true;
+            return -1;
+        }
+        return MemoryStream::Write(buffer, n, user);
+    }
+};
+
+TEST(MultiPage, FailedExifDirectoryLeavesEveryPageWhole) {
+    // The page whose EXIF directory could not be written stays as it was
+    // written (without an EXIF link), and the next page gets a directory of
+    // its own instead of rewriting it.
+    WriteJob job(Dest::Callbacks);
+    ExifFailingStream stream;
+    job->destWriteProc = ExifFailingStream::Write;
+    job->destUserData = job->sourceUserData = &stream;
+    for (int page = 0; page < 2; ++page) {
+        Metadata metadata;
+        metadata.Float(ZAN_METADATA_EXIF, EXIFTAG_FNUMBER, 2.0f + page);
+        job->writeMetadataList = metadata.get();
+        job.Describe(2, 6 + page, 3, 1);
+        ASSERT_TRUE(job.WriteRows(PatternRows(3, 6 + page, page)));
+        EXPECT_EQ(zanTIFFNextImage(job.host().ctx()), 1) << page;
+        job->writeMetadataList = nullptr;
+    }
+    job.Finish();
+    EXPECT_TRUE(stream.failed);
+    EXPECT_EQ(job.host().Errors(), std::vector<std::string>{"TIFF EXIF write error"});
+    const auto pages = DecodeWithLibtiff(stream.data);
+    ASSERT_EQ(pages.size(), 2u);
+    for (uint32_t page = 0; page < 2; ++page) {
+        EXPECT_EQ(pages[page].width, 6 + page);
+        Bytes pixels;
+        for (const Bytes& row : PatternRows(3, 6 + page, page)) pixels.insert(pixels.end(), row.begin(), row.end());
+        EXPECT_EQ(pages[page].pixels, pixels) << page;
+    }
+    EXPECT_EQ(FNumber(stream.data, 0), 0.0f) << "no EXIF link to a directory that is not there";
+    EXPECT_EQ(FNumber(stream.data, 1), 3.0f);
+}
+
+TEST(MultiPage, ExifCostsTheSameForEveryPage) {
+    // The destination is read back a fixed number of times a page: a
+    // job of twice the pages reads about twice as often (a walk of the
+    // chain for every page made it four times).
+    auto readsFor = [](int pages) {
+        WriteJob job(Dest::Callbacks);
+        Metadata metadata;
+        metadata.Float(ZAN_METADATA_EXIF, EXIFTAG_FNUMBER, 2.8f);
+        job->writeMetadataList = metadata.get();
+        for (int page = 0; page < pages; ++page) {
+            job.Describe(2, 4, 2, 1);
+            EXPECT_TRUE(job.WriteRows(PatternRows(2, 4)));
+            EXPECT_EQ(zanTIFFNextImage(job.host().ctx()), 1);
+        }
+        job->writeMetadataList = nullptr;
+        const Bytes tiff = job.Finish();
+        EXPECT_EQ(DecodeWithLibtiff(tiff).size(), static_cast<size_t>(pages));
+        EXPECT_EQ(FNumber(tiff, static_cast<uint32_t>(pages - 1)), 2.8f);
+        return static_cast<const MemoryStream*>(job->sourceUserData)->reads;
+    };
+    const int few = readsFor(40), many = readsFor(80);
+    EXPECT_LT(many, few * 5 / 2) << few << " reads for 40 pages, " << many << " for 80";
+}
+
+TEST(PageMetadata, PerSampleFieldsTakeOneValueAndTheEntriesAfterThemArrive) {
+    // The forms the metadata reader gives these fields; the entries behind
+    // them (a text, a resolution, the ICC profile) still reach the page.
+    Metadata metadata;
+    metadata.Short(ZAN_METADATA_IMAGE, TIFFTAG_SAMPLEFORMAT, SAMPLEFORMAT_UINT);
+    metadata.Short(ZAN_METADATA_IMAGE, TIFFTAG_MINSAMPLEVALUE, 3);
+    metadata.Short(ZAN_METADATA_IMAGE, TIFFTAG_MAXSAMPLEVALUE, 250);
+    metadata.Short(ZAN_METADATA_IMAGE, TIFFTAG_DATATYPE, 1);
+    MetadataValue low{}, high{};
+    low.f64 = 2.0;  // stored in the samples' own integer type
+    high.f64 = 240.0;
+    metadata.Add(ZAN_METADATA_IMAGE, TIFFTAG_SMINSAMPLEVALUE, ZAN_METADATA_AS_CODEC, low);
+    metadata.Add(ZAN_METADATA_IMAGE, TIFFTAG_SMAXSAMPLEVALUE, ZAN_METADATA_AS_CODEC, high);
+    metadata.Text(ZAN_METADATA_IMAGE, TIFFTAG_ARTIST, "after them");
+    metadata.Float(ZAN_METADATA_IMAGE, TIFFTAG_XRESOLUTION, 200);
+    const uint8_t profile[8] = {1, 2, 3, 4, 5, 6, 7, 8};
+    metadata.Block(ZAN_METADATA_ICC, TIFFTAG_ICCPROFILE, profile, sizeof profile);
+    const Written written = WritePage(&metadata);
+    EXPECT_TRUE(written.errors.empty()) << ::testing::PrintToString(written.errors);
+    PageReader page(written.tiff);
+    EXPECT_EQ(page.U16(TIFFTAG_MINSAMPLEVALUE), 3u);
+    EXPECT_EQ(page.U16(TIFFTAG_MAXSAMPLEVALUE), 250u);
+    double sMin = 0;
+    ASSERT_TRUE(TIFFGetField(page.get(), TIFFTAG_SMINSAMPLEVALUE, &sMin));
+    EXPECT_EQ(sMin, 2.0);
+    EXPECT_EQ(page.Text(TIFFTAG_ARTIST), "after them");
+    EXPECT_EQ(page.F32(TIFFTAG_XRESOLUTION), 200.0f);
+    uint32_t size = 0;
+    void* icc = nullptr;
+    ASSERT_TRUE(TIFFGetField(page.get(), TIFFTAG_ICCPROFILE, &size, &icc));
+    EXPECT_EQ(size, sizeof profile);
+}
+
 TEST(PageMetadata, GuardedTagsTheSetUpWroteAreKept) {
     Metadata metadata;
     metadata.Text(ZAN_METADATA_IMAGE, TIFFTAG_SOFTWARE, "metadata software");

@@ -43,10 +43,13 @@ TEST_F(TagRewriteTest, ValuesOfEveryFormAreWrittenToTheFirstPage) {
     const float white[2] = {0.3127f, 0.329f};
     const uint8_t undefined = 7;  // 50740 DNGPrivateData is UNDEFINED: a single value is passed over
     const int orientation = 3;
+    // Per-sample values that libtiff keeps as one: the first is taken.
+    const uint16_t minimum[3] = {10, 20, 30};
+    const double sMaximum[2] = {7.0, 9.0};  // stored in the samples' own integer type
     // A text takes any count; a rational comes from a float, a pair from two words.
-    ASSERT_EQ(Rewrite({270, 282, 297, 338, 700, 318, 50740, 274, 305},
-                      {text, &dpi, pages, extra, xmp, white, &undefined, &orientation, text},
-                      {12345, 1, 2, 1, 5, 2, 1, 1, 1}),
+    ASSERT_EQ(Rewrite({270, 282, 297, 338, 700, 318, 50740, 274, 305, 280, 341},
+                      {text, &dpi, pages, extra, xmp, white, &undefined, &orientation, text, minimum, sMaximum},
+                      {12345, 1, 2, 1, 5, 2, 1, 1, 1, 3, 2}),
               1)
         << ::testing::PrintToString(host_.Errors());
     const Bytes tiff = ReadFileBytes(file_.path());
@@ -67,6 +70,10 @@ TEST_F(TagRewriteTest, ValuesOfEveryFormAreWrittenToTheFirstPage) {
     ASSERT_TRUE(TIFFGetField(page.get(), TIFFTAG_WHITEPOINT, &wp));
     EXPECT_FLOAT_EQ(wp[1], 0.329f);
     EXPECT_EQ(page.Text(TIFFTAG_SOFTWARE), "rewritten");
+    EXPECT_EQ(page.U16(TIFFTAG_MINSAMPLEVALUE), 10u);
+    double sMax = 0;
+    ASSERT_TRUE(TIFFGetField(page.get(), TIFFTAG_SMAXSAMPLEVALUE, &sMax));
+    EXPECT_EQ(sMax, 7.0);
     EXPECT_EQ(PageReader(tiff, 1).Text(TIFFTAG_SOFTWARE), "") << "later pages keep their directories";
     EXPECT_EQ(DecodeWithLibtiff(tiff).size(), 2u);
 }

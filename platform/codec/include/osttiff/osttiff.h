@@ -77,6 +77,10 @@ OSTTIFF_API void* TIFFGetContextPivlo(TIFF* tif);
  * writing a directory. */
 OSTTIFF_API int TIFFIOFailedPivlo(TIFF* tif);
 
+/* Forgets a failure that has been dealt with (a directory written on its
+ * own that nothing links to), so that later writes are judged on their own. */
+OSTTIFF_API void TIFFClearIOFailedPivlo(TIFF* tif);
+
 /* 32-bit views of StripOffsets/TileOffsets and StripByteCounts/TileByteCounts
  * of the current directory: 1 and the value, or 0 when the index is out of
  * range or the value does not fit in 32 bits. */
@@ -140,6 +144,14 @@ OSTTIFF_API uint64_t TIFFLastPageOffsetPivlo(TIFF* tif);
  * holds one entry fewer. 1, or 0 when the page or the entry cannot be
  * reached. */
 OSTTIFF_API int TIFFSetLastPageEXIFPivlo(TIFF* tif, uint64_t exifOffset);
+
+/* ---- image reading ---- */
+
+/* TIFFRGBAImageGet, with libtiff 4.5's check of uncompressed tiles against
+ * its rounded read buffer worked around (RGBA reads of such tiles from a
+ * source that is not mapped into memory fail otherwise). */
+OSTTIFF_API int TIFFRGBAImageGetPivlo(TIFFRGBAImage* image, uint32_t* raster, uint32_t width,
+                                      uint32_t height);
 
 /* ---- writing helpers ---- */
 

@@ -116,8 +116,8 @@ TEST(FrameWriter, RefusalsAndTheirMessages) {
     // bits (and wrapped to a small one before).
     FrameJob small(8, 10, 10, 30);
     small->frameBufferSize = 200;
-    FrameJob absurd(8, 4, 4, 16);
-    absurd->frameWidth = absurd->frameHeight = 0xFFFFFFFFu;
+    FrameJob absurd(7, 4, 4, 16);  // 2^31 x 2^31 RGBA pixels of 16 bits: 2^65 bytes
+    absurd->frameWidth = absurd->frameHeight = 0x80000000u;
     absurd->bitsPerSample = 16;
     absurd->frameBufferSize = 0;
     for (FrameJob* job : {&small, &absurd}) {

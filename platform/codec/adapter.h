@@ -30,6 +30,7 @@ struct Adapter {
     uint64_t completedExtraDirectory = 0;
     uint16_t storedExtraCount = 0;
     bool extraCompleted = false;
+    int sixteenBitOutput = 0;      // RGBA reads give 16-bit samples (TIFFSet16BitOutput)
 };
 
 // The adapter of a codec object opened by TIFFClientOpenPivlo; null for any

@@ -219,6 +219,11 @@ int TIFFIOFailedPivlo(TIFF* tif) {
     return a ? a->ioFailed : 0;
 }
 
+uint64_t TIFFClientSizePivlo(TIFF* tif) {
+    Adapter* a = AdapterOfTiff(tif);
+    return a && a->size ? a->size(a->client) : 0;
+}
+
 void TIFFClearIOFailedPivlo(TIFF* tif) {
     if (Adapter* a = AdapterOfTiff(tif)) a->ioFailed = 0;
 }

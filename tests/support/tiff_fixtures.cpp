@@ -90,6 +90,7 @@ bool SetPageTags(TIFF* tif, const PageSpec& p) {
                                 p.colorMap.data() + 2 * n);
     }
     if (p.jpegQuality) ok = ok && TIFFSetField(tif, TIFFTAG_JPEGQUALITY, p.jpegQuality);
+    if (p.orientation) ok = ok && TIFFSetField(tif, TIFFTAG_ORIENTATION, p.orientation);
     if (p.tileWidth) {
         ok = ok && TIFFSetField(tif, TIFFTAG_TILEWIDTH, p.tileWidth) &&
              TIFFSetField(tif, TIFFTAG_TILELENGTH, p.tileHeight);

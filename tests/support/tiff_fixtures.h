@@ -47,6 +47,7 @@ struct PageSpec {
     Bytes iccProfile;                    // ICCProfile when not empty
     std::vector<uint16_t> colorMap;      // ColorMap (red, green, blue tables) when not empty
     int jpegQuality = 0;                 // JPEG pages: quality when nonzero
+    uint16_t orientation = 0;            // Orientation when nonzero
 };
 
 struct FileSpec {

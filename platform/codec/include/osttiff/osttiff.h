@@ -77,6 +77,10 @@ OSTTIFF_API void* TIFFGetContextPivlo(TIFF* tif);
  * writing a directory. */
 OSTTIFF_API int TIFFIOFailedPivlo(TIFF* tif);
 
+/* Size of the source or destination as its client size procedure gives
+ * it (0 when it has none). */
+OSTTIFF_API uint64_t TIFFClientSizePivlo(TIFF* tif);
+
 /* Forgets a failure that has been dealt with (a directory written on its
  * own that nothing links to), so that later writes are judged on their own. */
 OSTTIFF_API void TIFFClearIOFailedPivlo(TIFF* tif);
@@ -152,6 +156,88 @@ OSTTIFF_API int TIFFSetLastPageEXIFPivlo(TIFF* tif, uint64_t exifOffset);
  * source that is not mapped into memory fail otherwise). */
 OSTTIFF_API int TIFFRGBAImageGetPivlo(TIFFRGBAImage* image, uint32_t* raster, uint32_t width,
                                       uint32_t height);
+
+/* The image reader with replaceable put routines: a strip-organised page's
+ * own samples, decoded strip by strip and handed to the record's put
+ * routine, which places them in the caller's raster. TIFFImageBegin fills
+ * the record from the page (tiled pages and YCbCr samples stored in
+ * subsampled blocks are refused, the reason in `message`) and chooses
+ * putcontigcopy or putstripsepcopy; the caller may replace `put`, and set
+ * `reduceTo8` to have 16-bit samples delivered as their high byte.
+ * TIFFImageGet decodes the page's first `height` rows (width must be the
+ * page's); the copying put routines place them bottom row first, rows of
+ * `rowBytes` (a contiguous row of every sample, or for separate planes one
+ * plane's row, the planes one after another). Without stop-on-error a strip
+ * that cannot be read (the codec reports it) leaves its rows as they were.
+ * TIFFImageEnd releases what Begin took. */
+typedef struct TIFFImageRecord TIFFImageRecord;
+typedef void (*TIFFImagePut)(TIFFImageRecord* image, uint8_t* raster, uint32_t row, uint32_t rows,
+                             uint16_t plane, const uint8_t* data);
+struct TIFFImageRecord {
+    TIFF* tif;
+    uint32_t width;
+    uint32_t height;
+    uint16_t bitsPerSample;
+    uint16_t samplesPerPixel;
+    uint16_t planarConfig;
+    uint16_t reduceTo8;       /* set by the caller */
+    int stopOnError;
+    uint32_t rowsPerStrip;
+    uint64_t storedRowBytes;  /* a decoded row as the codec gives it */
+    uint64_t rowBytes;        /* a row as placed in the raster (set by TIFFImageGet) */
+    uint32_t rasterHeight;    /* rows of the raster (set by TIFFImageGet) */
+    TIFFImagePut put;
+    void* strip;              /* one decoded strip */
+    tmsize_t stripSize;
+};
+OSTTIFF_API int TIFFImageBegin(TIFFImageRecord* image, TIFF* tif, int stopOnError, char message[1024]);
+OSTTIFF_API int TIFFImageGet(TIFFImageRecord* image, uint8_t* raster, uint32_t width, uint32_t height);
+OSTTIFF_API void TIFFImageEnd(TIFF* tif, TIFFImageRecord* image);
+OSTTIFF_API void putcontigcopy(TIFFImageRecord* image, uint8_t* raster, uint32_t row, uint32_t rows,
+                               uint16_t plane, const uint8_t* data);
+OSTTIFF_API void putstripsepcopy(TIFFImageRecord* image, uint8_t* raster, uint32_t row, uint32_t rows,
+                                 uint16_t plane, const uint8_t* data);
+
+/* RGBA reading. TIFFReadRGBAImagePivlo reads the page as 4 samples a pixel,
+ * bottom row first (libtiff's TIFFReadRGBAImage): 8 bits each, or 16 bits
+ * each once TIFFSet16BitOutput was called on the object (libtiff's own
+ * reader has 8 bits only; 16-bit grey, grey with alpha, RGB, RGBA and
+ * palette pages are read here, in strips or tiles, contiguous or planar). */
+OSTTIFF_API int TIFFSet16BitOutput(TIFF* tif);
+OSTTIFF_API int TIFFReadRGBAImagePivlo(TIFF* tif, uint32_t width, uint32_t height, void* raster,
+                                       int stopOnError);
+
+/* Packing routines: a bottom-up RGBA raster (of TIFFReadRGBAImagePivlo)
+ * into a top-down frame in place, at the raster's start: RGB of 8 bits,
+ * grey of 8 bits, bilevel (rows of whole bytes, first pixel in the high
+ * bit, 1 = white unless minIsWhite), RGB of 16 bits, grey of 16 bits. Grey
+ * and bilevel frames of a min-is-white page (minIsWhite 1) hold
+ * min-is-white values. The context argument is the job's (unused here).
+ * 1 on success. */
+OSTTIFF_API int zanTIFFMirrorAndConvertRGBAToRGB(void* context, void* raster, uint32_t width, uint32_t height);
+OSTTIFF_API int zanTIFFMirrorAndConvertRGBAToGRAY(void* context, void* raster, uint32_t width, uint32_t height,
+                                                  int minIsWhite);
+OSTTIFF_API int zanTIFFMirrorAndConvertRGBAToBW(void* context, void* raster, uint32_t width, uint32_t height,
+                                                int minIsWhite);
+OSTTIFF_API int zanTIFFMirrorRGBAW(void* context, void* raster, uint32_t width, uint32_t height, int unused);
+OSTTIFF_API int zanTIFFMirrorRGBAToGRAYW(void* context, void* raster, uint32_t width, uint32_t height,
+                                         int minIsWhite);
+
+/* A whole frame through the RGBA reader: the raster (4 bytes a pixel, 8
+ * for the 16-bit frames) ends up holding the top-down frame of `packing`
+ * at its start, as TIFFReadRGBAImagePivlo and the packing routine give it.
+ * 8-bit RGB and grey pages are written in the frame's form as they are
+ * decoded, without the RGBA pass. 1 on success, 0 after the codec
+ * reported. */
+enum {
+    TIFF_FRAME_RGB8 = 0,
+    TIFF_FRAME_GREY8 = 1,
+    TIFF_FRAME_BILEVEL = 2,
+    TIFF_FRAME_RGB16 = 3,
+    TIFF_FRAME_GREY16 = 4
+};
+OSTTIFF_API int TIFFReadRGBAFramePivlo(TIFF* tif, void* raster, uint32_t width, uint32_t height, int packing,
+                                       int minIsWhite);
 
 /* ---- writing helpers ---- */
 

@@ -99,6 +99,24 @@ PIVLO_API void zanMake2ByteIntLittle(ConversionContext* ctx, uint16_t value, uns
 PIVLO_API void zanMake4ByteIntBig(ConversionContext* ctx, uint32_t value, unsigned char* bytes);
 PIVLO_API void zanMake4ByteIntLittle(ConversionContext* ctx, uint32_t value, unsigned char* bytes);
 
+/* ---- pixel routines ---- */
+
+/* Swaps the rows of an image of `rows` rows of `rowBytes` bytes top to
+ * bottom, in place. Nonzero on success. */
+PIVLO_API int zanVerticalReverseImage(ConversionContext* ctx, void* buffer, uint32_t rowBytes, uint32_t rows);
+
+/* The host's palette of 4-bit RGB frames: entry r*4 + g*2 + b is the colour
+ * whose channels are full where the bit is set, zero where it is not. */
+PIVLO_API extern const uint8_t pivloRgbPalette8[8][3];
+
+/* Three 1-bit planes (rows of (width + 7) / 8 bytes, first pixel in the high
+ * bit) into one 4-bit image of pivloRgbPalette8 indices: rows of
+ * (width + 1) / 2 bytes, first pixel in the high nibble. `destination` must
+ * not overlap the planes. Nonzero on success. */
+PIVLO_API int zanConvert1BitRGBPlanarTo4BitRGBPalette8(ConversionContext* ctx, const void* red,
+                                                      const void* green, const void* blue, void* destination,
+                                                      uint32_t width, uint32_t height);
+
 /* Reverses the bit order inside each byte (FillOrder 2 <-> 1), in place. */
 PIVLO_API void zanByteReverseBuffer(ConversionContext* ctx, void* buffer, uint32_t byteCount);
 

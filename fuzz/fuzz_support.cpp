@@ -92,4 +92,65 @@ FILE* TemporaryStream(const std::vector<uint8_t>& bytes) {
     return f;
 }
 
+std::vector<uint8_t> JpegTiff(const JpegPageLayout& layout, const std::vector<std::vector<uint8_t>>& pieces) {
+    std::vector<uint8_t> t = {'I', 'I', 42, 0, 0, 0, 0, 0};
+    auto put16 = [&](uint16_t v) { t.push_back(v & 0xFF); t.push_back(v >> 8); };
+    auto put32 = [&](uint32_t v) { put16(v & 0xFFFF); put16(v >> 16); };
+    auto append = [&](const std::vector<uint8_t>& bytes) {
+        if (t.size() & 1) t.push_back(0);
+        const auto at = static_cast<uint32_t>(t.size());
+        t.insert(t.end(), bytes.begin(), bytes.end());
+        return at;
+    };
+    const uint32_t tables = append(pieces[0]);
+    std::vector<uint32_t> offsets, counts;
+    for (size_t i = 1; i < pieces.size(); ++i) {
+        offsets.push_back(append(pieces[i]));
+        counts.push_back(static_cast<uint32_t>(pieces[i].size()));
+    }
+    if (offsets.empty()) {
+        offsets.push_back(tables);
+        counts.push_back(0);
+    }
+    auto array = [&](const std::vector<uint32_t>& v) {
+        std::vector<uint8_t> bytes;
+        for (uint32_t x : v) for (int i = 0; i < 4; ++i) bytes.push_back(static_cast<uint8_t>(x >> (8 * i)));
+        return append(bytes);
+    };
+    const auto n = static_cast<uint32_t>(offsets.size());
+    const uint32_t offsetsAt = n > 1 ? array(offsets) : offsets[0];
+    const uint32_t countsAt = n > 1 ? array(counts) : counts[0];
+    const bool colour = layout.kind != 0;
+    const uint32_t bitsAt = colour ? array({0x00080008u, 0x00000008u}) : 8;  // three SHORT 8s
+    if (t.size() & 1) t.push_back(0);
+    const auto ifd = static_cast<uint32_t>(t.size());
+    t[4] = ifd & 0xFF;
+    t[5] = (ifd >> 8) & 0xFF;
+    t[6] = (ifd >> 16) & 0xFF;
+    t[7] = ifd >> 24;
+    struct Entry { uint16_t tag, type; uint32_t count, value; };
+    std::vector<Entry> entries = {
+        {256, 4, 1, layout.width}, {257, 4, 1, layout.height}, {258, 3, colour ? 3u : 1u, bitsAt},
+        {259, 3, 1, 7}, {262, 3, 1, layout.kind == 0 ? 1u : layout.kind == 1 ? 6u : 2u},
+        {273, 4, n, offsetsAt}, {277, 3, 1, colour ? 3u : 1u}, {278, 4, 1, layout.rowsPerStrip},
+        {279, 4, n, countsAt}, {347, 7, static_cast<uint32_t>(pieces[0].size()), tables}};
+    if (layout.kind == 1) entries.push_back({530, 3, 2, 0x00020002u});
+    put16(static_cast<uint16_t>(entries.size()));
+    for (const Entry& e : entries) {
+        put16(e.tag);
+        put16(e.type);
+        put32(e.count);
+        // A value of up to 4 bytes lies in the entry: small JPEGTables too.
+        if (e.tag == 347 && e.count <= 4) {
+            uint32_t inline_ = 0;
+            for (uint32_t i = 0; i < e.count; ++i) inline_ |= uint32_t{pieces[0][i]} << (8 * i);
+            put32(inline_);
+        } else {
+            put32(e.value);
+        }
+    }
+    put32(0);
+    return t;
+}
+
 }  // namespace zanfuzz

@@ -37,4 +37,14 @@ std::vector<uint8_t> TinyTiff();
 // A read-write stream in the temporary directory holding `bytes`.
 FILE* TemporaryStream(const std::vector<uint8_t>& bytes);
 
+// A one-page JPEG TIFF (little-endian) whose JPEGTables is pieces[0] and
+// whose strips are the other pieces, as they are.
+struct JpegPageLayout {
+    uint32_t width = 8;
+    uint32_t height = 8;
+    uint32_t rowsPerStrip = 8;
+    int kind = 0;  // 0 grey, 1 YCbCr 2x2, 2 RGB
+};
+std::vector<uint8_t> JpegTiff(const JpegPageLayout& layout, const std::vector<std::vector<uint8_t>>& pieces);
+
 }  // namespace zanfuzz

@@ -170,6 +170,10 @@ private:
         }
         if (strips > 1 || TIFFIsTiled(tif_) || (bits == 1 && photometric != PHOTOMETRIC_MINISWHITE)) {
             *direct = 0;
+            zanTrace(ctx_,
+                     strips > 1 || TIFFIsTiled(tif_) ? "No direct conversion: the Group 4 page has several strips or tiles."
+                                                     : "No direct conversion: the Group 4 page is not min-is-white.",
+                     1);
             return false;
         }
         *direct = 1;

@@ -92,15 +92,23 @@ int extractSingleStrip(TIFF* tif, uint32_t reverse, bool adobeSegment) {
     const uint32_t strips = TIFFNumberOfStrips(tif);
     uint64_t total = 0;
     if (!StripSizes(ctx, tif, strips, &total)) return 0;
-    RawDelivery out(ctx);
-    if (!out.Begin(total + (adobeSegment ? sizeof kAdobeSegment : 0), "Memory allocation error.")) return 0;
+    // The first strip is read before the destination is prepared, so that
+    // a memory block is exactly the size delivered.
     StripBuffer buffer(ctx);
+    const uint32_t first = strips ? StripSize(tif, 0) : 0;
+    if (strips && !buffer.Read(tif, 0, first)) return 0;
+    if (reverse) zanByteReverseBuffer(ctx, buffer.data(), first);
+    const bool insertAdobe = adobeSegment && first >= 2 && !HasAdobeSegment(buffer.data(), first);
+    RawDelivery out(ctx);
+    if (!out.Begin(total + (insertAdobe ? sizeof kAdobeSegment : 0), "Memory allocation error.")) return 0;
     for (uint32_t i = 0; i < strips; ++i) {
         const uint32_t size = StripSize(tif, i);
-        if (!buffer.Read(tif, i, size)) return 0;
-        if (reverse) zanByteReverseBuffer(ctx, buffer.data(), size);
+        if (i > 0) {
+            if (!buffer.Read(tif, i, size)) return 0;
+            if (reverse) zanByteReverseBuffer(ctx, buffer.data(), size);
+        }
         uint32_t from = 0;
-        if (i == 0 && adobeSegment && size >= 2 && !HasAdobeSegment(buffer.data(), size)) {
+        if (i == 0 && insertAdobe) {
             if (!out.Write(buffer.data(), 2) || !out.Write(kAdobeSegment, sizeof kAdobeSegment)) return 0;
             from = 2;
         }
@@ -281,8 +289,13 @@ int JpegJoin::Run() {
     if (samples == 3 && photometric == PHOTOMETRIC_RGB && !out_.Write(kAdobeSegment, sizeof kAdobeSegment)) return 0;
     for (uint32_t i = 0; i < strips; ++i) {
         const uint32_t size = StripSize(tif_, i);
-        if (!strip_.Read(tif_, i, size)) return 0;
-        uint8_t* data = strip_.data();
+        // A memory destination takes the strip where its data goes, and
+        // the headers are dropped in place; others go through the strip
+        // buffer.
+        uint8_t* data = out_.Reserve(size);
+        if (data ? TIFFReadRawStrip(tif_, i, data, size) != static_cast<tmsize_t>(size) : !strip_.Read(tif_, i, size))
+            return 0;
+        if (!data) data = strip_.data();
         uint32_t at = 0, scan = 0;
         if (size > 0 && data[0] == 0xFF)
             if (const char* reason = WalkHeaders(i, data, size, &at, &scan)) return Decline(reason);
@@ -292,9 +305,24 @@ int JpegJoin::Run() {
         if (i + 1 < strips) data[size - 1] = static_cast<uint8_t>(0xD0 + counter_++ % 8);
         if (i == 0) {
             if (const char* reason = CheckFrameHeader(rowsPerStrip, strips)) return Decline(reason);
+            if (data != strip_.data()) {
+                // The frame header goes before the strip's data: the strip
+                // moves aside in the block first.
+                const uint32_t header = 2 + sofLength_ + (strips > 1 || stripHadDri_ ? 6 : 0);
+                uint8_t* moved = out_.Reserve(header + size);
+                if (!moved) return Decline("Conversion w/o decompression failed: no room for the frame header.");
+                std::memmove(moved + header, data, size);
+                data = moved + header;
+            }
             if (!WriteFrameHeader(strips)) return 0;
         }
-        if (!out_.Write(data + at, size - at)) return 0;
+        if (data == strip_.data()) {
+            if (!out_.Write(data + at, size - at)) return 0;
+        } else {
+            uint8_t* to = out_.Reserve(size - at);
+            std::memmove(to, data + at, size - at);
+            out_.Commit(size - at);
+        }
     }
     out_.Finish();
     ctx_->outputWidth = imageWidth_;

@@ -83,6 +83,12 @@ bool RawDelivery::Write(const void* data, uint32_t n) {
     return true;
 }
 
+uint8_t* RawDelivery::Reserve(uint32_t n) {
+    if (written_ + n > capacity_) return nullptr;
+    if (ctx_->destKind == ZAN_DEST_FIXED_BUFFER) return static_cast<uint8_t*>(ctx_->destMemory) + written_;
+    return block_ ? block_ + written_ : nullptr;
+}
+
 void RawDelivery::Finish() {
     finished_ = true;
     if (ctx_->destKind == ZAN_DEST_FILE) {
@@ -90,12 +96,9 @@ void RawDelivery::Finish() {
     } else if (ctx_->destKind == ZAN_DEST_FIXED_BUFFER) {
         if (ctx_->destSizeOut) *ctx_->destSizeOut = static_cast<uint32_t>(written_);
     } else if (ctx_->destKind != ZAN_DEST_CALLBACKS) {
-        // The block is handed over at exactly the size written.
-        void* block = block_;
-        if (written_ < capacity_ && ctx_->reallocProc)
-            if (void* shrunk = ctx_->reallocProc(block_, static_cast<uint32_t>(written_ ? written_ : 1))) block = shrunk;
-        if (ctx_->destMemory) *static_cast<void**>(ctx_->destMemory) = block;
-        else ReleaseBlock(ctx_, block);
+        // The block goes as it was taken: of the bound Begin was given.
+        if (ctx_->destMemory) *static_cast<void**>(ctx_->destMemory) = block_;
+        else ReleaseBlock(ctx_, block_);
         if (ctx_->destSizeOut) *ctx_->destSizeOut = static_cast<uint32_t>(written_);
         block_ = nullptr;
     }

@@ -28,9 +28,15 @@ public:
     // Appends `n` bytes. False after a reported failure.
     bool Write(const void* data, uint32_t n);
 
-    // Hands the data over: the block and its size through destMemory and
-    // destSizeOut (when the host set them), the size of a fixed buffer's
-    // data through destSizeOut.
+    // Room for `n` bytes at the end of a memory destination (a block or a
+    // fixed buffer), to be filled in place and then taken with Commit; null
+    // for other destinations or when the room is not there.
+    uint8_t* Reserve(uint32_t n);
+    void Commit(uint32_t n) { written_ += n; }
+
+    // Hands the data over: the block (of the bound given to Begin) and the
+    // size written through destMemory and destSizeOut (when the host set
+    // them), the size of a fixed buffer's data through destSizeOut.
     void Finish();
 
     uint64_t written() const { return written_; }

@@ -22,6 +22,19 @@ head -c 8 "$work/p1.png" | od -An -c | grep -q "P   N   G" || fail "page 1 is no
 # 16-bit grey: PNG colour type 0 and bit depth 16 at bytes 24-25 of the header.
 [ "$(od -An -tu1 -j24 -N2 "$work/p3.png" | tr -s ' ')" = " 16 0" ] || fail "page 3 is no 16-bit grey PNG"
 
+# The whole page in one call gives the same pixels as its lines.
+"$tool" decode "$sample" --page 1 --frame -o "$work/f1.png"
+"$tool" decode "$sample" --page 3 --frame -o "$work/f3.png"
+cmp -s "$work/p1.png" "$work/f1.png" || fail "frame of page 1 differs from its lines"
+cmp -s "$work/p3.png" "$work/f3.png" || fail "16-bit frame of page 3 differs from its lines"
+
+# Pages of other compressions cannot be passed through: a reason, a failing
+# status and no file.
+if "$tool" jpeg "$sample" --page 1 -o "$work/p1.jpg" 2>"$work/err"; then fail "LZW page passed as JPEG"; fi
+grep -q "cannot be passed through as JPEG" "$work/err" || fail "no reason for the refused JPEG"
+[ ! -e "$work/p1.jpg" ] || fail "a refused JPEG left a file"
+if "$tool" g4 "$sample" --page 1 -o "$work/p1.g4" 2>/dev/null; then fail "LZW page passed as Group 4"; fi
+
 if "$tool" info "$sample" --page 9 2>"$work/err"; then fail "page 9 described"; fi
 grep -q "Unable to access target page." "$work/err" || fail "no message for page 9"
 echo "read commands: ok"

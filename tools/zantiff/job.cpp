@@ -38,7 +38,10 @@ void Job::OnMessage(ConversionContext* ctx, int severity, int, const char* text)
     const std::string line = Trimmed(text);
     if (line.empty()) return;  // the version report's blank lines
     if (severity == PIVLO_ERROR) job->errors_.push_back(line);
-    if (severity == PIVLO_TRACE) return;
+    if (severity == PIVLO_TRACE) {
+        job->traces_.push_back(line);
+        return;
+    }
     const std::string shown = std::string(severity == PIVLO_ERROR ? "error: " : "warning: ") + line;
     if (job->quiet_) job->lines_.push_back(shown);
     else std::fprintf(stderr, "zantiff: %s\n", shown.c_str());

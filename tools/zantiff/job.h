@@ -29,6 +29,8 @@ public:
     void Quiet() { quiet_ = true; }
     void Print() const;
     const std::vector<std::string>& errors() const { return errors_; }
+    // The module's traces (level 1 notes of what it did or declined).
+    const std::vector<std::string>& traces() const { return traces_; }
     bool HasError(const std::string& text) const;
 
 private:
@@ -39,6 +41,7 @@ private:
     ConversionContext ctx_{};
     bool quiet_ = false;
     std::vector<std::string> errors_;
+    std::vector<std::string> traces_;
     std::vector<std::string> lines_;
 };
 

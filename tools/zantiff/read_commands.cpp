@@ -281,10 +281,84 @@ int Decode(const std::string& path, int page, const std::string& outPath) {
     return writer->Finish() ? 0 : 1;
 }
 
+// ---- whole pages: decode --frame, jpeg, g4 ----
+
+// A frame of zanTIFFToFrameBuffer's RGBA way as PNG: RGB or grey of 8 or
+// 16 bits, or bilevel (min-is-white frames turned min-is-black, as PNG has
+// them).
+int WriteFrame(const ConversionContext* ctx, const std::string& outPath) {
+    ImageLayout layout;
+    layout.width = ctx->frameWidth;
+    layout.height = ctx->frameHeight;
+    layout.channels = ctx->outputSamplesPerPixel;
+    layout.bits = ctx->outputBitsPerSample;
+    const bool whiteIsZero = ctx->frameWhiteIsZero && layout.channels == 1;
+    const uint64_t rowBytes = (uint64_t{layout.width} * layout.channels * layout.bits + 7) / 8;
+    File out = OpenFile(outPath, "wb");
+    if (!out) return 1;
+    auto writer = StartPng(out.get(), layout);
+    if (!writer) {
+        std::fprintf(stderr, "zantiff: no PNG form for this frame\n");
+        return 1;
+    }
+    const auto* frame = static_cast<const uint8_t*>(ctx->frameData);
+    std::vector<uint8_t> row(static_cast<size_t>(rowBytes));
+    for (uint32_t y = 0; y < layout.height; ++y) {
+        std::memcpy(row.data(), frame + y * rowBytes, row.size());
+        if (whiteIsZero) InvertGrey(row, static_cast<uint32_t>(rowBytes), layout, false);
+        if (!writer->WriteRow(row.data())) return 1;
+    }
+    return writer->Finish() ? 0 : 1;
+}
+
+// The whole page in one call: 16-bit frames for pages deeper than 8 bits.
+int DecodeFrame(const std::string& path, int page, const std::string& outPath) {
+    File in = OpenFile(path, "rb");
+    if (!in) return 1;
+    Job job;
+    job->sourceKind = ZAN_SOURCE_FILE;
+    job->sourceFp = in.get();
+    job->pageNumber = page;
+    if (!zanTIFFGetInfo(job.get())) return 1;
+    job->outputBitsPerSample = job->bitsPerSample > 8 ? 16 : 8;
+    uint32_t direct = 0;
+    if (!zanTIFFToFrameBuffer(job.get(), &direct)) return 1;
+    return WriteFrame(job.get(), outPath);
+}
+
+// The page's compressed data as it is stored (Group 4), or as one JPEG
+// stream (the strips joined), written to `outPath`. A page that cannot be
+// passed through this way is reported with the module's reason.
+int PassThrough(const std::string& path, int page, const std::string& outPath, uint32_t destFormat) {
+    File in = OpenFile(path, "rb");
+    if (!in) return 1;
+    Job job;
+    job->sourceKind = ZAN_SOURCE_FILE;
+    job->sourceFp = in.get();
+    job->pageNumber = page;
+    job->destFormat = destFormat;
+    job->destKind = ZAN_DEST_FILE;
+    job->destPath = outPath.c_str();
+    uint32_t direct = 0;
+    const int result = zanTIFFToFrameBuffer(job.get(), &direct);
+    const bool passed = result && direct == 1;
+    if (job->destFp) std::fclose(job->destFp);
+    job->destFp = nullptr;
+    if (passed) return 0;
+    std::remove(outPath.c_str());
+    if (result) {
+        const std::string reason = job.traces().empty() ? "it is not compressed that way" : job.traces().back();
+        std::fprintf(stderr, "zantiff: page %d of %s cannot be passed through as %s: %s\n", page, path.c_str(),
+                     destFormat == ZAN_DEST_FORMAT_JPEG ? "JPEG" : "Group 4", reason.c_str());
+    }
+    return 1;
+}
+
 struct ReadArguments {
     std::string file, output;
     int page = 1;
     bool json = false;
+    bool frame = false;
 };
 
 }  // namespace
@@ -301,7 +375,22 @@ void AddReadCommands(CLI::App& app, int& status) {
     decode->add_option("FILE", args.file, "TIFF file")->required();
     decode->add_option("-p,--page", args.page, "page number, from 1");
     decode->add_option("-o,--output", args.output, "PNG (or PAM) file to write")->required();
-    decode->callback([&status] { status = Decode(args.file, args.page, args.output); });
+    decode->add_flag("--frame", args.frame, "decode the whole page in one call (RGB, grey or bilevel PNG)");
+    decode->callback([&status] {
+        status = args.frame ? DecodeFrame(args.file, args.page, args.output) : Decode(args.file, args.page, args.output);
+    });
+
+    auto* jpeg = app.add_subcommand("jpeg", "Write a JPEG page's data as one JPEG file, without decoding it");
+    jpeg->add_option("FILE", args.file, "TIFF file")->required();
+    jpeg->add_option("-p,--page", args.page, "page number, from 1");
+    jpeg->add_option("-o,--output", args.output, "JPEG file to write")->required();
+    jpeg->callback([&status] { status = PassThrough(args.file, args.page, args.output, ZAN_DEST_FORMAT_JPEG); });
+
+    auto* g4 = app.add_subcommand("g4", "Write a Group 4 page's data as a bare Group 4 stream");
+    g4->add_option("FILE", args.file, "TIFF file")->required();
+    g4->add_option("-p,--page", args.page, "page number, from 1");
+    g4->add_option("-o,--output", args.output, "Group 4 file to write")->required();
+    g4->callback([&status] { status = PassThrough(args.file, args.page, args.output, ZAN_DEST_FORMAT_G4); });
 }
 
 }  // namespace zantool

@@ -3,6 +3,7 @@
 //   make_bench_inputs large OUT.tif       one 8192x8192 8-bit RGB page, uncompressed (~200 MB)
 //   make_bench_inputs sample OUT.tif      the demo's 3-page file: RGB (LZW), palette, 16-bit grey
 //   make_bench_inputs rgb W H OUT.tif     one W x H 8-bit RGB page, uncompressed
+//   make_bench_inputs jpeg OUT.jpg        an 8000x6000 4:2:0 JPEG of about 30 MB (libjpeg)
 
 #include <cstdio>
 #include <cstdlib>
@@ -11,6 +12,8 @@
 #include <vector>
 
 #include <tiffio.h>
+
+#include "bench_jpeg.h"
 
 namespace {
 
@@ -79,14 +82,15 @@ bool WriteGrey16Page(TIFF* tif, uint32_t width, uint32_t height) {
 
 int main(int argc, char** argv) {
     const std::string kind = argc > 1 ? argv[1] : "";
-    const bool known = ((kind == "multipage" || kind == "large" || kind == "sample") && argc == 3) ||
+    const bool known = ((kind == "multipage" || kind == "large" || kind == "sample" || kind == "jpeg") && argc == 3) ||
                        (kind == "rgb" && argc == 5);
     // Anything else is refused before a file is created: a mistyped call must
     // not leave a 200 MB page under an unexpected name.
     if (!known) {
-        std::fprintf(stderr, "usage: make_bench_inputs multipage|large|sample OUT.tif | rgb W H OUT.tif\n");
+        std::fprintf(stderr, "usage: make_bench_inputs multipage|large|sample OUT.tif | rgb W H OUT.tif | jpeg OUT.jpg\n");
         return 2;
     }
+    if (kind == "jpeg") return zanbench::WriteBenchJpeg(argv[2]) ? 0 : 1;
     TIFF* tif = TIFFOpen(argv[argc - 1], "w");
     if (!tif) return 1;
     bool ok = true;

@@ -1,9 +1,11 @@
 #include "fuzz_support.h"
 
 #include <algorithm>
+#include <cstdlib>
 #include <cstring>
 
 #include "pivlo/pivlo.h"
+#include "zantiff/zantiff.h"
 
 namespace zanfuzz {
 namespace {
@@ -151,6 +153,25 @@ std::vector<uint8_t> JpegTiff(const JpegPageLayout& layout, const std::vector<st
     }
     put32(0);
     return t;
+}
+
+void RequestJpegData(const void* tiff, uint32_t size) {
+    ConversionContext ctx;
+    InitQuietJob(&ctx);
+    ctx.sourceKind = ZAN_SOURCE_MEMORY;
+    ctx.sourceMemory = tiff;
+    ctx.sourceMemorySize = size;
+    ctx.destFormat = ZAN_DEST_FORMAT_JPEG;
+    void* block = nullptr;
+    uint32_t produced = 0;
+    ctx.destKind = ZAN_DEST_MEMORY;
+    ctx.destMemory = &block;
+    ctx.destSizeOut = &produced;
+    uint32_t direct = 0;
+    zanTIFFToFrameBuffer(&ctx, &direct);
+    zanDestroyTIFF(&ctx);
+    pivloReleaseContext(&ctx);
+    std::free(block);
 }
 
 }  // namespace zanfuzz

@@ -31,6 +31,10 @@ void UseInputAsSource(ConversionContext* ctx, InputStream* input, uint8_t select
 
 namespace zanfuzz {
 
+// The TIFF in `tiff` asked for as JPEG data through the whole-page call (a
+// page that cannot pass through is decoded); everything is released.
+void RequestJpegData(const void* tiff, uint32_t size);
+
 // A small valid one-page TIFF (grey 4x2, little-endian).
 std::vector<uint8_t> TinyTiff();
 

@@ -29,7 +29,7 @@ done
   echo "| case | module (ms) | reference | reference (ms) | ratio |"
   echo "|---|---|---|---|---|"
   awk -F, '
-    { name=$1; gsub(/"/, "", name); sub(/_median$/, "", name);
+    { name=$1; gsub(/"/, "", name); sub(/_median$/, "", name); sub(/\/iterations:[0-9]+$/, "", name);
       t=$3; unit=$5; gsub(/"/, "", unit);
       if (unit == "ns") t /= 1e6; else if (unit == "us") t /= 1e3; else if (unit == "s") t *= 1e3;
       # Module_Case or Module/Case (BENCHMARK_CAPTURE) against Reference_Case or Reference/Case.

@@ -106,6 +106,8 @@ void RedirectCodecMessages(ConversionContext* ctx) {
     gSlots.owner = ctx;
 }
 
+bool CodecMessagesRedirected(const ConversionContext* ctx) { return gSlots.owner == ctx; }
+
 void RestoreCodecMessages(ConversionContext* ctx) {
     if (gSlots.owner != ctx) return;
     TIFFSetErrorHandler(ctx->savedErrorHandler);

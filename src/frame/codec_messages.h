@@ -18,6 +18,9 @@ constexpr int MESSAGE_BUFFER_SIZE = 512;
 // handlers saved first are the ones put back.
 void RedirectCodecMessages(ConversionContext* ctx);
 
+// True while this job's redirection is in force.
+bool CodecMessagesRedirected(const ConversionContext* ctx);
+
 // Puts back the handlers saved when this job redirected; nothing when the job
 // has no redirection in force (so a job that never opened anything leaves the
 // codec's handlers alone).

@@ -3,6 +3,7 @@
 
 #include "frame/tiff_open.h"
 
+#include <algorithm>
 #include <cstdio>
 
 #include "frame/codec_messages.h"
@@ -147,7 +148,7 @@ int OpenTIFFForReading(ConversionContext* ctx) {
     return 1;
 }
 
-int OpenTIFFForWriting(ConversionContext* ctx) {
+int OpenTIFFForWriting(ConversionContext* ctx, const WriteOpening& opening) {
     if (ctx->tiff) return 1;
     RedirectCodecMessages(ctx);
     const char* mode = ctx->appendPages == 1 ? "a" : "w";
@@ -157,7 +158,7 @@ int OpenTIFFForWriting(ConversionContext* ctx) {
         if (!(ctx->destFileFlags & ZAN_DEST_FILE_USE_AS_IS)) {
             if (ctx->destFp) std::fclose(ctx->destFp);
             ctx->destFp = ctx->destPath ? std::fopen(ctx->destPath, "r+b") : nullptr;
-            if (!ctx->destFp) return FailWriting(ctx, "Unable to reopen destination file.");
+            if (!ctx->destFp) return FailWriting(ctx, opening.reopenFailure);
         }
         if (!BindFile(ctx, ctx->destFp, ctx->destBaseOffset))
             return FailWriting(ctx, "Memory allocation");
@@ -184,7 +185,8 @@ int OpenTIFFForWriting(ConversionContext* ctx) {
         procs = FixedBufferDestProcs();
         break;
     case ZAN_DEST_MEMORY: {
-        const uint32_t capacity = ctx->frameBufferSize / 2 + 60;
+        const uint64_t wanted = opening.memoryCapacity ? opening.memoryCapacity : ctx->frameBufferSize / 2 + 60;
+        const auto capacity = static_cast<uint32_t>(std::min<uint64_t>(wanted, 0xFFFFFFFFu));
         void* block = AllocateBlock(ctx, capacity);
         if (!block) return FailWriting(ctx, "Memory allocation");
         ctx->memBase = ctx->memPos = static_cast<unsigned char*>(block);

@@ -10,9 +10,17 @@ namespace zan {
 // nothing left held.
 int OpenTIFFForReading(ConversionContext* ctx);
 
+// How a destination is opened, where callers differ: the message of a
+// destination file that cannot be reopened, and the first capacity of a
+// growing memory image (0: frameBufferSize / 2 + 60).
+struct WriteOpening {
+    const char* reopenFailure = "Unable to reopen destination file.";
+    uint64_t memoryCapacity = 0;
+};
+
 // 1 when `tiff` holds a codec object bound to the destination (at once when
 // one is already open), 0 after a reported failure.
-int OpenTIFFForWriting(ConversionContext* ctx);
+int OpenTIFFForWriting(ConversionContext* ctx, const WriteOpening& opening = WriteOpening{});
 
 // Releases the job's file record, if any.
 void ReleaseFileHandle(ConversionContext* ctx);

@@ -6,7 +6,9 @@
 
 #include <tiffio.h>
 
+#include <algorithm>
 #include <cstring>
+#include <memory>
 
 #include "read_support.h"
 #include "support/corpus.h"
@@ -291,6 +293,83 @@ TEST(JpegJoin, FailuresOfMemoryAndFilesAreReported) {
     unopenable.job()->destPath = "/nonexistent-dir/zantiff/out.jpg";
     EXPECT_EQ(unopenable.Run(), 0);
     EXPECT_EQ(unopenable.job().host().Errors(), std::vector<std::string>{"File access error."});
+}
+
+// `stream` wrapped into a one-page TIFF in memory by the module: a JPEG
+// from memory, or a Group 4 stream of `width` x `height` min-is-white pixels
+// read from a file where it starts at byte 100.
+Bytes Wrapped(const Bytes& stream, bool jpeg, uint32_t width = 0, uint32_t height = 0) {
+    TestHost host;
+    void* block = nullptr;
+    uint32_t size = 0;
+    host->sourceKind = ZAN_SOURCE_MEMORY;
+    host->sourceMemory = stream.data();
+    host->sourceMemorySize = static_cast<uint32_t>(stream.size());
+    TempFile file;
+    std::unique_ptr<FILE, int (*)(FILE*)> fp(nullptr, std::fclose);
+    if (!jpeg) {
+        Bytes padded(100 + stream.size(), 0xFF);
+        std::copy(stream.begin(), stream.end(), padded.begin() + 100);
+        WriteFileBytes(file.path(), padded);
+        fp.reset(std::fopen(file.c_str(), "rb"));
+        std::fseek(fp.get(), 100, SEEK_SET);
+        host->sourceKind = ZAN_SOURCE_FILE;
+        host->sourceFp = fp.get();
+    }
+    host->destKind = ZAN_DEST_MEMORY;
+    host->destMemory = &block;
+    host->destSizeOut = &size;
+    host->imageWidth = width;
+    host->imageHeight = height;
+    host->whiteIsZero = 1;
+    uint32_t direct = 1;
+    const int result = jpeg ? zanJPEGToTIFF(host.ctx(), &direct) : zanG4ToTIFF(host.ctx());
+    EXPECT_EQ(result, 1) << ::testing::PrintToString(host.Errors());
+    EXPECT_EQ(direct, 1u);
+    host.EndJob();
+    Bytes tiff = block ? Bytes(static_cast<uint8_t*>(block), static_cast<uint8_t*>(block) + size) : Bytes();
+    TestAllocator::Free(block);
+    return tiff;
+}
+
+// What the pass-through delivers for the page, or empty when it declines.
+Bytes PassedThrough(const Bytes& tiff, uint32_t destFormat) {
+    PassJob pass(tiff, destFormat, Out::Memory);
+    return pass.Run() == 1 && pass.direct() == 1 ? pass.Delivered() : Bytes();
+}
+
+TEST(RoundTrips, StreamsTakenFromPagesAndWrappedAgainComeBackUnchanged) {
+    JpegPageSpec rgb;
+    rgb.rgb = true;
+    rgb.h = rgb.v = 1;
+    JpegPageSpec grey;
+    grey.components = 1;
+    grey.h = grey.v = 1;
+    for (const JpegPageSpec& spec : {JpegPageSpec{}, rgb, grey}) {
+        const Bytes page = MakeJpegTiff(spec);
+        const Bytes stream = PassedThrough(page, ZAN_DEST_FORMAT_JPEG);
+        ASSERT_FALSE(stream.empty());
+        const Bytes wrapped = Wrapped(stream, true);
+        EXPECT_EQ(PassedThrough(wrapped, ZAN_DEST_FORMAT_JPEG), stream) << spec.components << spec.rgb;
+    }
+    // Group 4 pages of the corpus: the stream, wrapped again, is the page.
+    int pages = 0;
+    for (const CorpusFile& file : CorpusFiles()) {
+        if (file.status != "ok" || file.description.find("MinIsWhite; CCITT-G4; 1 strip(s)") == std::string::npos)
+            continue;
+        SCOPED_TRACE(file.relpath);
+        const Bytes page = ReadFileBytes(file.path);
+        const Bytes stream = PassedThrough(page, ZAN_DEST_FORMAT_G4);
+        ASSERT_FALSE(stream.empty());
+        const DecodedPage source = DecodeWithLibtiff(page).at(0);
+        const Bytes wrapped = Wrapped(stream, false, source.width, source.height);
+        EXPECT_EQ(DecodeWithLibtiff(wrapped).at(0).pixels, source.pixels);
+        EXPECT_EQ(PassedThrough(wrapped, ZAN_DEST_FORMAT_G4), stream);
+        ++pages;
+    }
+    if (!CorpusDir().empty()) {
+        EXPECT_GT(pages, 3);
+    }
 }
 
 }  // namespace

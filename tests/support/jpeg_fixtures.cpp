@@ -90,7 +90,60 @@ Bytes MakeJpegTiff(const JpegPageSpec& spec) {
     return ReadFileBytes(file.path());
 }
 
-DecodedJpeg DecodeJpeg(const Bytes& jpeg, bool rgbComponents) {
+Bytes MakeJpeg(const JpegStreamSpec& spec) {
+    const JpegPageSpec& page = spec.page;
+    jpeg_compress_struct c{};
+    jpeg_error_mgr errors{};
+    c.err = jpeg_std_error(&errors);
+    jpeg_create_compress(&c);
+    c.image_width = page.width;
+    c.image_height = page.height;
+    c.input_components = page.components;
+    c.in_color_space = page.components == 1 ? JCS_GRAYSCALE : page.components == 4 ? JCS_CMYK : JCS_RGB;
+    jpeg_set_defaults(&c);
+    if (page.components == 3) jpeg_set_colorspace(&c, page.rgb ? JCS_RGB : JCS_YCbCr);
+    jpeg_set_quality(&c, 90, TRUE);
+    c.comp_info[0].h_samp_factor = page.h;
+    c.comp_info[0].v_samp_factor = page.v;
+    if (page.components >= 3) {
+        c.comp_info[1].h_samp_factor = spec.cbH;
+        c.comp_info[1].v_samp_factor = spec.cbV;
+        c.comp_info[2].h_samp_factor = spec.crH;
+        c.comp_info[2].v_samp_factor = spec.crV;
+    }
+    if (spec.densityUnit) {
+        c.write_JFIF_header = TRUE;
+        c.density_unit = static_cast<UINT8>(spec.densityUnit);
+        c.X_density = c.Y_density = static_cast<UINT16>(spec.density);
+    }
+    unsigned char* memory = nullptr;
+    unsigned long size = 0;
+    jpeg_mem_dest(&c, &memory, &size);
+    jpeg_start_compress(&c, TRUE);
+    Bytes row(static_cast<size_t>(page.width) * page.components);
+    for (uint32_t y = 0; y < page.height; ++y) {
+        for (uint32_t x = 0; x < page.width; ++x)
+            for (int k = 0; k < page.components; ++k) row[x * page.components + k] = JpegSourceSample(x, y, k);
+        JSAMPROW pointer = row.data();
+        jpeg_write_scanlines(&c, &pointer, 1);
+    }
+    jpeg_finish_compress(&c);
+    jpeg_destroy_compress(&c);
+    return TakeMemory(memory, size);
+}
+
+void SetFrameSampling(Bytes& jpeg, int component, int h, int v) {
+    // SOF0: FF C0, length, precision, height, width, count, then three bytes
+    // a component: id, sampling (h << 4 | v), table.
+    for (size_t at = 2; at + 4 < jpeg.size(); ++at)
+        if (jpeg[at] == 0xFF && jpeg[at + 1] == 0xC0) {
+            const size_t sampling = at + 11 + 3 * static_cast<size_t>(component);
+            if (sampling < jpeg.size()) jpeg[sampling] = static_cast<uint8_t>(h << 4 | v);
+            return;
+        }
+}
+
+DecodedJpeg DecodeJpeg(const Bytes& jpeg, bool rgbComponents, bool fancyUpsampling) {
     DecodedJpeg decoded;
     jpeg_decompress_struct d{};
     ErrorJump errors{};
@@ -105,7 +158,7 @@ DecodedJpeg DecodeJpeg(const Bytes& jpeg, bool rgbComponents) {
     jpeg_mem_src(&d, jpeg.data(), static_cast<unsigned long>(jpeg.size()));
     jpeg_read_header(&d, TRUE);
     d.dct_method = JDCT_ISLOW;
-    d.do_fancy_upsampling = FALSE;
+    d.do_fancy_upsampling = fancyUpsampling ? TRUE : FALSE;
     if (rgbComponents && d.num_components == 3) d.jpeg_color_space = JCS_RGB;
     d.out_color_space = d.num_components == 1 ? JCS_GRAYSCALE : JCS_RGB;
     jpeg_start_decompress(&d);

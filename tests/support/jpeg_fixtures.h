@@ -27,6 +27,21 @@ uint8_t JpegSourceSample(uint32_t x, uint32_t y, int component);
 // One-page TIFF whose strips are JPEG streams of the spec.
 Bytes MakeJpegTiff(const JpegPageSpec& spec);
 
+// One whole JPEG stream of the spec's page (its strips ignored): components
+// 1 grey, 3 YCbCr (or RGB), 4 CMYK; `cbH`/`cbV` and `crH`/`crV` the chroma
+// sampling; a JFIF density of `density` (unit `densityUnit`: 1 inch, 2 cm).
+struct JpegStreamSpec {
+    JpegPageSpec page;
+    int cbH = 1, cbV = 1, crH = 1, crV = 1;
+    int density = 0, densityUnit = 0;
+};
+Bytes MakeJpeg(const JpegStreamSpec& spec);
+
+// Rewrites the sampling factors of `component` in the stream's frame header:
+// layouts libjpeg's encoder refuses to make (fractional ones) but whose
+// headers it reads.
+void SetFrameSampling(Bytes& jpeg, int component, int h, int v);
+
 // Decodes a JPEG stream with libjpeg (integer DCT, no fancy upsampling):
 // RGB or grey rows top first, or empty when libjpeg cannot. With
 // `rgbComponents` three components are taken as RGB whatever the stream
@@ -36,7 +51,7 @@ struct DecodedJpeg {
     int components = 0;
     Bytes pixels;
 };
-DecodedJpeg DecodeJpeg(const Bytes& jpeg, bool rgbComponents = false);
+DecodedJpeg DecodeJpeg(const Bytes& jpeg, bool rgbComponents = false, bool fancyUpsampling = false);
 
 // The page decoded the way its strips are stored: each strip, with the
 // page's tables in front, decoded on its own, the rows stacked.

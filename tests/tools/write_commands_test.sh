@@ -1,7 +1,7 @@
 #!/usr/bin/env bash
 # The zantiff tool's writing commands end to end: PNG pages in and out
 # again must keep their pixels; copies keep pages and metadata.
-# Usage: write_commands_test.sh ZANTIFF SAMPLE (tiffinfo on the PATH)
+# Usage: write_commands_test.sh ZANTIFF SAMPLE (libtiff's tools on the PATH)
 set -euo pipefail
 tool=$1
 sample=$2
@@ -36,6 +36,34 @@ cmp -s "$work/back.png" "$work/rgb.png" || fail "frame: pixels differ"
 
 "$tool" encode "$work/rgb.png" -o "$work/jpeg.tif" --compression jpeg
 tiffinfo "$work/jpeg.tif" 2>/dev/null | grep -q "Compression Scheme: JPEG" || fail "jpeg compression"
+
+# A JPEG stream taken from a page and stored again comes back byte for byte,
+# and keeps its pixels; added to an existing file, the other pages stay.
+"$tool" jpeg "$work/jpeg.tif" -o "$work/page.jpg"
+"$tool" wrap "$work/page.jpg" -o "$work/wrapped.tif" --dpi 150 >/dev/null
+tiffinfo "$work/wrapped.tif" 2>/dev/null | grep -q "Resolution: 150, 150 pixels/inch" || fail "wrap: dpi"
+"$tool" jpeg "$work/wrapped.tif" -o "$work/again.jpg"
+cmp -s "$work/page.jpg" "$work/again.jpg" || fail "wrap: stream changed"
+"$tool" wrap "$work/page.jpg" -o "$work/lzw.tif" --append >/dev/null
+[ "$(tiffinfo "$work/lzw.tif" 2>/dev/null | grep -c 'Image Width')" = 3 ] || fail "wrap --append: pages"
+"$tool" decode "$work/lzw.tif" --page 1 -o "$work/back.png"
+cmp -s "$work/back.png" "$work/rgb.png" || fail "wrap --append: first page changed"
+# Not a JPEG: refused with the reader's reason.
+if "$tool" wrap "$work/rgb.png" -o "$work/x.tif" 2>"$work/err"; then fail "PNG wrapped"; fi
+grep -q "JPEG" "$work/err" || fail "wrap: no reason for a PNG"
+
+# A Group 4 stream stored again decodes to the same pixels (the page made
+# with libtiff's tools: dithered, and relabelled min-is-white).
+tiffcp "$sample,0" "$work/first.tif"
+tiff2bw "$work/first.tif" "$work/grey.tif"
+tiffdither -c g4 "$work/grey.tif" "$work/g4.tif"
+tiffset -s 262 0 "$work/g4.tif"
+"$tool" g4 "$work/g4.tif" -o "$work/page.g4"
+set -- $(tiffinfo "$work/g4.tif" 2>/dev/null | sed -n 's/.*Image Width: \([0-9]*\) Image Length: \([0-9]*\).*/\1 \2/p')
+"$tool" wrap-g4 "$work/page.g4" --width "$1" --height "$2" --white-is-zero -o "$work/rewrapped.tif"
+"$tool" decode "$work/g4.tif" -o "$work/a.png"
+"$tool" decode "$work/rewrapped.tif" -o "$work/b.png"
+cmp -s "$work/a.png" "$work/b.png" || fail "wrap-g4: pixels differ"
 
 # A copy keeps every page and the description of the first.
 "$tool" copy "$sample" -o "$work/copy.tif" --compression lzw

@@ -1,6 +1,7 @@
 // Commands that write pages: encode (PNG files to a multi-page TIFF, through
-// the scanline writer or the frame writer) and copy (every page of a TIFF
-// re-encoded through the reader and the writer, with metadata and EXIF).
+// the scanline writer or the frame writer), copy (every page of a TIFF
+// re-encoded through the reader and the writer, with metadata and EXIF), and
+// wrap and wrap-g4 (a JPEG or Group 4 stream stored as a page unchanged).
 
 #include <cstdio>
 #include <cstring>
@@ -77,10 +78,55 @@ bool EncodeFrame(const std::string& out, PngImage& image, bool append, float dpi
 struct WriteArguments {
     std::vector<std::string> inputs;
     std::string input, output, compression = "lzw";
-    bool predictor = false, frame = false;
+    bool predictor = false, frame = false, append = false, whiteIsZero = false;
     float dpi = 0;
+    uint32_t width = 0, height = 0;
     std::string copyCompression;
 };
+
+// The stream file as the job's source, from its first byte.
+File UseStreamSource(Job& job, const std::string& path) {
+    File source = OpenFile(path, "rb");
+    job->sourceKind = ZAN_SOURCE_FILE;
+    job->sourceFp = source.get();
+    job->sourceBaseOffset = 0;
+    return source;
+}
+
+// A JPEG file as a page of its own, its stream unchanged; a stream TIFF
+// cannot hold as it is is refused with the module's reason, never
+// re-encoded.
+int Wrap(const WriteArguments& args) {
+    Job job;
+    const File source = UseStreamSource(job, args.input);
+    if (!source || !UseFileDestination(job, args.output, args.append)) return 1;
+    job->outputXResolution = job->outputYResolution = args.dpi;
+    uint32_t direct = 1;
+    const int result = zanJPEGToTIFF(job.get(), &direct);
+    CloseDestination(job);
+    if (result && !direct) {
+        const std::string why = job.traces().empty() ? "no reason given" : job.traces().back();
+        std::fprintf(stderr, "zantiff: %s cannot be stored without re-encoding (%s)\n", args.input.c_str(), why.c_str());
+        return 2;
+    }
+    if (!result) return 1;
+    std::printf("%ux%u JPEG stored as a page of %s\n", job->outputWidth, job->outputHeight, args.output.c_str());
+    return 0;
+}
+
+// A bare Group 4 stream of the given size as a page of its own.
+int WrapG4(const WriteArguments& args) {
+    Job job;
+    const File source = UseStreamSource(job, args.input);
+    if (!source || !UseFileDestination(job, args.output, args.append)) return 1;
+    job->imageWidth = args.width;
+    job->imageHeight = args.height;
+    job->whiteIsZero = args.whiteIsZero ? 1 : 0;
+    job->outputXResolution = job->outputYResolution = args.dpi;
+    const int result = zanG4ToTIFF(job.get());
+    CloseDestination(job);
+    return result ? 0 : 1;
+}
 
 int Encode(const WriteArguments& args) {
     const auto compression = kCompressions.find(args.compression);
@@ -152,6 +198,24 @@ void AddWriteCommands(CLI::App& app, int& status) {
     copy->add_option("-c,--compression", args.copyCompression, "as for encode; default: the source's");
     copy->add_flag("--predictor", args.predictor, "horizontal predictor for LZW");
     copy->callback([&status] { status = Copy(args); });
+
+    auto* wrap = app.add_subcommand("wrap", "Store a JPEG file as a TIFF page without re-encoding it");
+    wrap->add_option("IN", args.input, "JPEG file")->required();
+    wrap->add_option("-o,--output", args.output, "TIFF file to write")->required();
+    wrap->add_flag("--append", args.append, "add the page to the TIFF file instead of replacing it");
+    wrap->add_option("--dpi", args.dpi, "resolution in pixels per inch; default: the JPEG's own");
+    wrap->footer("Exit status 2: the JPEG's layout cannot be stored as it is (the reason is printed).");
+    wrap->callback([&status] { status = Wrap(args); });
+
+    auto* wrapG4 = app.add_subcommand("wrap-g4", "Store a bare CCITT Group 4 stream as a TIFF page");
+    wrapG4->add_option("IN", args.input, "Group 4 (T.6) data")->required();
+    wrapG4->add_option("--width", args.width, "pixels a row")->required()->check(CLI::PositiveNumber);
+    wrapG4->add_option("--height", args.height, "rows")->required()->check(CLI::PositiveNumber);
+    wrapG4->add_flag("--white-is-zero", args.whiteIsZero, "0 bits are white (PhotometricInterpretation 0)");
+    wrapG4->add_option("-o,--output", args.output, "TIFF file to write")->required();
+    wrapG4->add_flag("--append", args.append, "add the page to the TIFF file instead of replacing it");
+    wrapG4->add_option("--dpi", args.dpi, "resolution in pixels per inch");
+    wrapG4->callback([&status] { status = WrapG4(args); });
 }
 
 }  // namespace zantool

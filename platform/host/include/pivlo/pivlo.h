@@ -99,6 +99,21 @@ PIVLO_API void zanMake2ByteIntLittle(ConversionContext* ctx, uint16_t value, uns
 PIVLO_API void zanMake4ByteIntBig(ConversionContext* ctx, uint32_t value, unsigned char* bytes);
 PIVLO_API void zanMake4ByteIntLittle(ConversionContext* ctx, uint32_t value, unsigned char* bytes);
 
+/* ---- source inspection ---- */
+
+/* Describes a JPEG source in the record, from libjpeg's header reader:
+ * imageWidth, imageHeight, componentCount, bitsPerSample (the sample
+ * precision), horizontalSampling and verticalSampling of the first three
+ * components (0 for components the stream lacks), xResolution and
+ * yResolution (the JFIF density in pixels per inch: centimetres converted, 0
+ * without a unit or a JFIF segment), and imageType: 14 grey, 17 RGB (an
+ * Adobe segment of transform 0, or components named R, G, B), 22 YCbCr, 28
+ * CMYK or YCCK. The source is the memory block (sourceKind 4), a stream with
+ * read and seek callbacks (read from its start; sourceKind 2), or sourceFp
+ * from sourceBaseOffset. Nonzero on success; a source that is missing or
+ * that libjpeg cannot read is reported. */
+PIVLO_API int zanGetImageInfo(ConversionContext* ctx);
+
 /* ---- pixel routines ---- */
 
 /* Swaps the rows of an image of `rows` rows of `rowBytes` bytes top to

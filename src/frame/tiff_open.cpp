@@ -12,7 +12,7 @@
 #include "frame/tiff_extent.h"
 #include "osttiff/osttiff.h"
 #include "pivlo/pivlo.h"
-#include "read/reader_buffers.h"
+#include "read/scanline_reader.h"
 #include "write/page_setup.h"
 #include "zantiff/zantiff.h"
 
@@ -215,6 +215,11 @@ int OpenTIFFForWriting(ConversionContext* ctx, const WriteOpening& opening) {
 extern "C" ZAN_API void zanDestroyTIFF(ConversionContext* ctx) {
     using namespace zan;
     if (!ctx) return;
+    // A stream decoder the host did not end (it closes its own codec object
+    // and gives the reader's buffers back).
+    auto* decoder = static_cast<TIFFStreamDecoder*>(ctx->streamDecoder);
+    ctx->streamDecoder = nullptr;
+    TIFFStreamDecodeEnd(ctx, &decoder);
     if (ctx->state == ZAN_STATE_WRITING && ctx->tiff) {
         // The page in progress is finished as zanTIFFNextImage would.
         FinishPage(ctx);

@@ -17,7 +17,7 @@
 #include "read/page_data.h"
 #include "read/page_description.h"
 #include "read/passthrough.h"
-#include "read/reader_buffers.h"
+#include "read/scanline_reader.h"
 #include "zantiff/zantiff.h"
 
 namespace zan {

@@ -14,7 +14,7 @@
 #include "osttiff/osttiff.h"
 #include "pivlo/pivlo.h"
 #include "read/colour_channels.h"
-#include "read/reader_buffers.h"
+#include "read/scanline_reader.h"
 #include "zantiff/zantiff.h"
 
 namespace zan {

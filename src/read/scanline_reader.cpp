@@ -15,7 +15,7 @@
 #include "read/colour_channels.h"
 #include "read/page_data.h"
 #include "read/page_description.h"
-#include "read/reader_buffers.h"
+#include "read/scanline_reader.h"
 #include "read/row_conversions.h"
 #include "zantiff/zantiff.h"
 
@@ -188,7 +188,8 @@ const char* SetUpRgbaBands(ConversionContext* ctx, TIFF* tif) {
     return nullptr;
 }
 
-// Chooses the conversions of the page and obtains the buffers they need.
+}  // namespace
+
 // Every size is worked out in 64 bits and refused beyond 32 bits.
 uint32_t SetUpPage(ConversionContext* ctx) {
     const bool openedHere = ctx->state != ZAN_STATE_DESCRIBED && !ctx->tiff;
@@ -308,6 +309,8 @@ uint32_t SetUpPage(ConversionContext* ctx) {
     return 1;
 }
 
+namespace {
+
 // Assembles the band of tiles that holds row `row` in the strip buffer: every
 // tile of that tile row, of every plane, at its place in the band's rows.
 bool ReadTileBand(ConversionContext* ctx, uint32_t row) {
@@ -332,6 +335,7 @@ bool ReadTileBand(ConversionContext* ctx, uint32_t row) {
     for (uint32_t plane = 0; plane < planes; ++plane)
         for (uint32_t x = 0; x < ctx->imageWidth; x += tileWidth) {
             const uint32_t index = TIFFComputeTile(tif, x, top, 0, static_cast<uint16_t>(plane));
+            if (ctx->bitsPerSample == 1) std::memset(tile, 0, static_cast<size_t>(tileSize));  // as for rows
             if (TIFFReadEncodedTile(tif, index, tile, tileSize) == -1) return false;
             const uint32_t columns = std::min(tileWidth, ctx->imageWidth - x);
             const size_t from = static_cast<size_t>(uint64_t{x} * pixelBits / 8);
@@ -380,6 +384,10 @@ bool ReadRow(ConversionContext* ctx, uint8_t* read) {
     TIFF* tif = ctx->tiff;
     const uint32_t row = ctx->currentRow;
     if (ctx->readByStrip == kScanlines) {
+        // Fax decoders write a row's pixels only, not the bits that pad its
+        // last byte: those are cleared, so that every line is the same
+        // whatever the buffer held before.
+        if (ctx->bitsPerSample == 1) std::memset(read, 0, ctx->scanlineSize);
         if (ctx->planarConfig != 2) return TIFFReadScanline(tif, read, row, 0) != -1;
         const uint32_t planes = ctx->fileSamplesPerPixel;
         const uint32_t planeRow = ctx->scanlineSize / planes;
@@ -403,8 +411,10 @@ bool ReadRow(ConversionContext* ctx, uint8_t* read) {
     return true;
 }
 
-// Bytes the reader writes into the host's line: the delivered line, and a
-// row read straight into it before it is widened in place.
+}  // namespace
+
+// The delivered line, and a row read straight into the line before it is
+// widened in place.
 uint64_t BytesWrittenToLine(const ConversionContext* ctx) {
     return UsesWorkLine(ctx) ? ctx->lineBytes : std::max(ctx->lineBytes, ctx->scanlineSize);
 }
@@ -431,7 +441,6 @@ uint32_t ReadNextRow(ConversionContext* ctx, uint8_t* line, uint32_t capacity) {
     return ctx->lineBytes;
 }
 
-}  // namespace
 }  // namespace zan
 
 extern "C" ZAN_API uint32_t zanTIFFReadNextScanLine(ConversionContext* ctx, void* line, uint32_t lineCapacity) {

@@ -118,6 +118,11 @@ bool WriteTiles(TIFF* tif, const PageSpec& p, uint32_t page) {
                             if (p.bitsPerSample == 16) {
                                 const uint16_t v16 = static_cast<uint16_t>(v);
                                 std::memcpy(&tile[index * 2], &v16, 2);
+                            } else if (p.bitsPerSample < 8) {
+                                // Tile rows of narrow samples start on a byte, first sample high.
+                                const size_t rowBits = (size_t{p.tileWidth} * perPixel * p.bitsPerSample + 7) / 8 * 8;
+                                const size_t bit = y * rowBits + (size_t{x} * perPixel + s) * p.bitsPerSample;
+                                tile[bit / 8] |= static_cast<uint8_t>(v << (8 - p.bitsPerSample - bit % 8));
                             } else {
                                 tile[index] = static_cast<uint8_t>(v);
                             }

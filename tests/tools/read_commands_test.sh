@@ -35,6 +35,15 @@ grep -q "cannot be passed through as JPEG" "$work/err" || fail "no reason for th
 [ ! -e "$work/p1.jpg" ] || fail "a refused JPEG left a file"
 if "$tool" g4 "$sample" --page 1 -o "$work/p1.g4" 2>/dev/null; then fail "LZW page passed as Group 4"; fi
 
+# The first page fed in pieces (from a file, and through a pipe) gives the
+# same lines; a cut stream says how far it got and fails.
+"$tool" decode --stream "$sample" -o "$work/s1.png"
+cmp -s "$work/p1.png" "$work/s1.png" || fail "streamed page differs from its lines"
+cat "$sample" | "$tool" decode --stream - --chunk 7 -o "$work/s1.png"
+cmp -s "$work/p1.png" "$work/s1.png" || fail "page streamed through a pipe differs"
+if head -c 5000 "$sample" | "$tool" decode --stream - -o "$work/cut.png" 2>"$work/err"; then fail "cut stream accepted"; fi
+grep -q "the input ended after" "$work/err" || fail "no message for a cut stream"
+
 if "$tool" info "$sample" --page 9 2>"$work/err"; then fail "page 9 described"; fi
 grep -q "Unable to access target page." "$work/err" || fail "no message for page 9"
 echo "read commands: ok"

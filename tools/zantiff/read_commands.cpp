@@ -1,10 +1,12 @@
 // Commands that read pages: info (description and metadata, text or JSON)
-// and decode (the scanline reader's lines as PNG or PAM).
+// and decode (the scanline reader's lines, or the stream decoder's bands, as
+// PNG or PAM).
 
 #include <tiffio.h>
 
 #include <algorithm>
 #include <cctype>
+#include <cerrno>
 #include <cstdio>
 #include <cstring>
 #include <nlohmann/json.hpp>
@@ -237,6 +239,44 @@ void InvertGrey(std::vector<uint8_t>& line, uint32_t bytes, const ImageLayout& l
     }
 }
 
+// The lines of a described page, as the scanline reader forms them,
+// written as PNG (or PAM): min-is-white grey turned min-is-black, separate
+// planes interleaved.
+class LineFile {
+public:
+    bool Start(const ConversionContext* ctx, const std::string& outPath) {
+        layout_ = LayoutOf(ctx);
+        whiteIsZero_ = ctx->imageType == ZAN_IMAGE_BILEVEL_WHITE_IS_ZERO || ctx->imageType == ZAN_IMAGE_GREY_WHITE_IS_ZERO;
+        planar_ = ctx->planarConfig == 2 && layout_.channels > 1;
+        out_ = OpenFile(outPath, "wb");
+        if (!out_) return false;
+        writer_ = NeedsPam(ctx, layout_) ? StartPam(out_.get(), layout_) : StartPng(out_.get(), layout_);
+        if (!writer_) std::fprintf(stderr, "zantiff: no PNG or PAM form for this page's lines\n");
+        return writer_ != nullptr;
+    }
+    bool Write(const uint8_t* line, uint32_t bytes) {
+        line_.assign(line, line + bytes);
+        if (whiteIsZero_) InvertGrey(line_, bytes, layout_, planar_);
+        if (planar_) {
+            interleaved_.resize(line_.size());
+            Interleave(line_, interleaved_, layout_);
+        }
+        if (++rows_ % 256 == 0 || rows_ == layout_.height) progress_.Update(rows_, layout_.height);
+        return writer_->WriteRow(planar_ ? interleaved_.data() : line_.data());
+    }
+    bool Finish() { return writer_->Finish(); }
+    uint32_t rows() const { return rows_; }
+
+private:
+    ImageLayout layout_;
+    bool whiteIsZero_ = false, planar_ = false;
+    File out_;
+    std::unique_ptr<ImageWriter> writer_;
+    std::vector<uint8_t> line_, interleaved_;
+    Progress progress_{"decode: row"};
+    uint32_t rows_ = 0;
+};
+
 int Decode(const std::string& path, int page, const std::string& outPath) {
     File in = OpenFile(path, "rb");
     if (!in) return 1;
@@ -256,29 +296,55 @@ int Decode(const std::string& path, int page, const std::string& outPath) {
     std::vector<uint8_t> line(static_cast<size_t>(room));
     uint32_t got = zanTIFFReadNextScanLine(job.get(), line.data(), static_cast<uint32_t>(line.size()));
     if (!got) return 1;
-    ImageLayout layout = LayoutOf(job.get());
-    const bool whiteIsZero = job->imageType == ZAN_IMAGE_BILEVEL_WHITE_IS_ZERO ||
-                             job->imageType == ZAN_IMAGE_GREY_WHITE_IS_ZERO;
-    File out = OpenFile(outPath, "wb");
-    if (!out) return 1;
-    auto writer = NeedsPam(job.get(), layout) ? StartPam(out.get(), layout) : StartPng(out.get(), layout);
-    if (!writer) {
-        std::fprintf(stderr, "zantiff: no PNG or PAM form for this page's lines\n");
-        return 1;
-    }
-    std::vector<uint8_t> interleaved(line.size());
-    Progress progress("decode: row");
+    LineFile file;
+    if (!file.Start(job.get(), outPath)) return 1;
     for (uint32_t row = 0;; ++row) {
-        if (whiteIsZero) InvertGrey(line, got, layout, job->planarConfig == 2);
-        const bool planar = job->planarConfig == 2 && layout.channels > 1;
-        if (planar) Interleave(line, interleaved, layout);
-        if (!writer->WriteRow(planar ? interleaved.data() : line.data())) return 1;
-        if (row % 256 == 0) progress.Update(row + 1, layout.height);
-        if (row + 1 == layout.height) break;
+        if (!file.Write(line.data(), got)) return 1;
+        if (row + 1 == job->imageHeight) break;
         got = zanTIFFReadNextScanLine(job.get(), line.data(), static_cast<uint32_t>(line.size()));
         if (!got) return 1;
     }
-    return writer->Finish() ? 0 : 1;
+    return file.Finish() ? 0 : 1;
+}
+
+// The first page of a file (or of standard input, "-") fed to the stream
+// decoder in pieces of `chunk` bytes, as a host receiving it over a pipe
+// would: the same lines as the scanline reader's.
+int DecodeStream(const std::string& path, uint32_t chunk, const std::string& outPath) {
+    FILE* in = path == "-" ? stdin : std::fopen(path.c_str(), "rb");
+    if (!in) {
+        std::fprintf(stderr, "zantiff: cannot open %s: %s\n", path.c_str(), std::strerror(errno));
+        return 1;
+    }
+    const File owned(in == stdin ? nullptr : in);
+    Job job;
+    job->outputBitsPerSample = 16;
+    if (zanTIFFStreamDecodeInit(job.get(), nullptr) != 2) return 1;
+    std::vector<uint8_t> piece(chunk);
+    StreamChunk stream{};
+    LineFile file;
+    bool ended = false;
+    int status = ZAN_STREAM_CONTINUE;
+    while (status == ZAN_STREAM_CONTINUE || status == ZAN_STREAM_PAGE_DESCRIBED) {
+        if (stream.inputLength == 0 && !ended) {
+            const size_t n = std::fread(piece.data(), 1, piece.size(), in);
+            stream.input = piece.data();
+            stream.inputLength = static_cast<uint32_t>(n);
+            if (n == 0) {
+                ended = true;
+                zanTIFFStreamDecodeComplete(job.get());
+            }
+        }
+        status = zanTIFFStreamDecode(job.get(), &stream);
+        if (status == ZAN_STREAM_PAGE_DESCRIBED && !file.Start(job.get(), outPath)) status = ZAN_STREAM_ERROR;
+        const auto* band = static_cast<const uint8_t*>(stream.output);
+        for (uint32_t r = 0; band && r < stream.bandRows && status != ZAN_STREAM_ERROR; ++r)
+            if (!file.Write(band + uint64_t{r} * stream.bandValue, stream.bandValue)) status = ZAN_STREAM_ERROR;
+    }
+    zanTIFFStreamDecodeEnd(job.get());
+    if (status == ZAN_STREAM_STATUS_6)
+        std::fprintf(stderr, "zantiff: the input ended after %u of the page's rows\n", file.rows());
+    return status == ZAN_STREAM_STATUS_5 && file.Finish() ? 0 : 1;
 }
 
 // ---- whole pages: decode --frame, jpeg, g4 ----
@@ -359,6 +425,8 @@ struct ReadArguments {
     int page = 1;
     bool json = false;
     bool frame = false;
+    bool stream = false;
+    uint32_t chunk = 64 << 10;
 };
 
 }  // namespace
@@ -376,8 +444,14 @@ void AddReadCommands(CLI::App& app, int& status) {
     decode->add_option("-p,--page", args.page, "page number, from 1");
     decode->add_option("-o,--output", args.output, "PNG (or PAM) file to write")->required();
     decode->add_flag("--frame", args.frame, "decode the whole page in one call (RGB, grey or bilevel PNG)");
+    decode->add_flag("--stream", args.stream,
+                     "feed the file (\"-\": standard input) to the stream decoder in pieces; first page only");
+    decode->add_option("--chunk", args.chunk, "bytes a piece with --stream (default 65536)")
+        ->check(CLI::Range(1u, 1u << 30));
     decode->callback([&status] {
-        status = args.frame ? DecodeFrame(args.file, args.page, args.output) : Decode(args.file, args.page, args.output);
+        if (args.stream) status = DecodeStream(args.file, args.chunk, args.output);
+        else if (args.frame) status = DecodeFrame(args.file, args.page, args.output);
+        else status = Decode(args.file, args.page, args.output);
     });
 
     auto* jpeg = app.add_subcommand("jpeg", "Write a JPEG page's data as one JPEG file, without decoding it");

@@ -153,3 +153,13 @@ extern "C" int zanGetImageInfo(ConversionContext* ctx) {
     jpeg_destroy_decompress(&d);
     return 1;
 }
+
+extern "C" uint32_t zanGetColorSpaceIfConvertedToRaw(ConversionContext* ctx) {
+    if (!ctx) return ZAN_COLORSPACE_RGB;
+    switch (ctx->colorSpace) {
+    case ZAN_COLORSPACE_BILEVEL:
+    case ZAN_COLORSPACE_GREY: return ZAN_COLORSPACE_GREY;
+    case ZAN_COLORSPACE_CMYK: return ZAN_COLORSPACE_CMYK;
+    default: return ZAN_COLORSPACE_RGB;
+    }
+}

@@ -239,6 +239,109 @@ enum {
 OSTTIFF_API int TIFFReadRGBAFramePivlo(TIFF* tif, void* raster, uint32_t width, uint32_t height, int packing,
                                        int minIsWhite);
 
+/* ---- push decoding ----
+ * A TIFF that arrives in pieces, without a seekable source, decoded as it
+ * comes: the host feeds each piece to TIFFStreamDecode and gets, piece by
+ * piece, the first page's description, bands of decoded rows, and the end of
+ * the page.
+ *
+ * Statuses of TIFFStreamDecode:
+ *   TIFF_STREAM_ERROR (1)      an error, explained through the codec's message
+ *                              handlers; it sticks: every later call gives 1
+ *   TIFF_STREAM_NEED_INPUT (2) the input given has been taken and nothing is
+ *                              ready: feed more (or call Complete)
+ *   TIFF_STREAM_HEADER (3)     the first page's directory has arrived: the
+ *                              page can be described through
+ *                              TIFFStreamDecodeTIFF (given once)
+ *   TIFF_STREAM_BAND (4)       a band is ready (TIFFStreamDecodeBand, or the
+ *                              raw block in the context in raw delivery)
+ *   TIFF_STREAM_PAGE_DONE (5)  every row of the page has been delivered
+ *                              (given from then on)
+ *   TIFF_STREAM_TRUNCATED (6)  the input ended (TIFFStreamDecodeComplete)
+ *                              before the page was complete
+ *
+ * A call delivers at most one band, and takes only the input it needs to
+ * make progress: `consumed` may be less than `length`, and the host passes
+ * the rest again. While bands are ready, a call with length 0 delivers the
+ * next one. A band stays valid until the next call.
+ *
+ * Bands hold whole rows, top row first. The rows are formed by the row
+ * reader the caller installs (TIFFStreamDecodeSetRowReader); without one
+ * they are the page's rows as TIFFReadScanline decodes them (strip pages).
+ * A band's rows are those whose strips or tiles (of every plane) have fully
+ * arrived, at most about 256 KiB of them.
+ *
+ * The context given to TIFFStreamDecodeInit is the job's ConversionContext:
+ * the decoder allocates through its allocProc, reallocProc and freeProc, and
+ * reads and writes its streamMode, rawBufferOutSize, rawOutput,
+ * rawOutputSize, rowsDelivered and outputSamplesPerPixel:
+ *   - streamMode 3 (raw delivery): once the header was given, the page's
+ *     first strip or tile is handed out undecoded in pieces of at most
+ *     rawBufferOutSize bytes (the whole of it when 0) through rawOutput and
+ *     rawOutputSize, one piece per status 4, then status 5;
+ *   - streamMode 4 (bypass): the page's single JPEG strip or tile is decoded
+ *     with libjpeg directly into bands of outputSamplesPerPixel samples (1
+ *     grey, 3 RGB, 4 CMYK); rowsDelivered counts the rows before the band.
+ *
+ * Memory is bounded by what has arrived and is not delivered yet: the
+ * bytes of strips and tiles already decoded are let go, and a page whose
+ * directory comes first is decoded holding a few strips. Before the
+ * directory arrives every byte is held (a file written with its directory
+ * last is held whole until then). More than 1 GiB held is an error. Input
+ * beyond 4 GiB is an error (positions are 32-bit). */
+enum {
+    TIFF_STREAM_ERROR = 1,
+    TIFF_STREAM_NEED_INPUT = 2,
+    TIFF_STREAM_HEADER = 3,
+    TIFF_STREAM_BAND = 4,
+    TIFF_STREAM_PAGE_DONE = 5,
+    TIFF_STREAM_TRUNCATED = 6
+};
+typedef struct TIFFStreamDecoder TIFFStreamDecoder;
+/* The band delivered by the last status 4 (bypass: `rows` is also
+ * `bypassRows`). `value` is the bytes of one band row. */
+typedef struct TIFFStreamBand {
+    void* data;
+    uint32_t width;
+    uint32_t rows;
+    uint32_t value;
+    uint32_t rowsRemaining;
+    uint32_t bypassRows;
+} TIFFStreamBand;
+/* How the rows of bands are formed. `begin` is called once the page's first
+ * rows can be read through `tif`, and gives the bytes of a delivered row and
+ * in `written` the bytes a row read may write (at least the row's); `read`
+ * forms the next row at `row` (room for `written` bytes); `end` is called
+ * when reading is over. begin gives 0 and read 0 after a reported failure. */
+typedef struct TIFFStreamRowReader {
+    void* user;
+    uint32_t (*begin)(void* user, TIFF* tif, uint32_t* written);
+    int (*read)(void* user, TIFF* tif, uint8_t* row);
+    void (*end)(void* user);
+} TIFFStreamRowReader;
+/* `hostValue` is kept for the caller (TIFFStreamDecodeHostValue); `context`
+ * is the job. Null when the decoder cannot be made (without a message). */
+OSTTIFF_API TIFFStreamDecoder* TIFFStreamDecodeInit(void* hostValue, void* context);
+OSTTIFF_API void TIFFStreamDecodeSetRowReader(TIFFStreamDecoder* decoder, const TIFFStreamRowReader* reader);
+OSTTIFF_API int TIFFStreamDecode(TIFFStreamDecoder* decoder, const void* input, uint32_t length,
+                                 uint32_t* consumed);
+/* No more input follows. */
+OSTTIFF_API void TIFFStreamDecodeComplete(TIFFStreamDecoder* decoder);
+/* Releases the decoder (its codec object included) and clears *decoder;
+ * nothing for a null decoder. */
+OSTTIFF_API void TIFFStreamDecodeEnd(void* context, TIFFStreamDecoder** decoder);
+/* The codec object of the page (null before status 3). */
+OSTTIFF_API TIFF* TIFFStreamDecodeTIFF(TIFFStreamDecoder* decoder);
+/* Colour-space code of the page in the host's numbering: 1 bilevel, 2 grey,
+ * 5 separated with four inks, 6 other separated, 8 otherwise. */
+OSTTIFF_API uint32_t TIFFStreamDecodeColorSpace(TIFFStreamDecoder* decoder);
+OSTTIFF_API const TIFFStreamBand* TIFFStreamDecodeBand(TIFFStreamDecoder* decoder);
+OSTTIFF_API void* TIFFStreamDecodeHostValue(TIFFStreamDecoder* decoder);
+/* Nonzero once the decoder delivered anything after the header (or asked
+ * for input to do so): from then on the context's streamMode is not looked
+ * at again. */
+OSTTIFF_API int TIFFStreamDecodeStarted(TIFFStreamDecoder* decoder);
+
 /* ---- writing helpers ---- */
 
 /* Nonzero when the current directory holds `tag` (libtiff's presence flag;

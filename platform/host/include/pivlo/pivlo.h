@@ -114,6 +114,12 @@ PIVLO_API void zanMake4ByteIntLittle(ConversionContext* ctx, uint32_t value, uns
  * that libjpeg cannot read is reported. */
 PIVLO_API int zanGetImageInfo(ConversionContext* ctx);
 
+/* The colour space (host code) in which this host takes the rows of a page
+ * whose single JPEG chunk is decoded directly: 2 grey for grey and bilevel
+ * pages, 5 CMYK for separated pages of four inks, 8 RGB otherwise (the
+ * page's colorSpace as described). */
+PIVLO_API uint32_t zanGetColorSpaceIfConvertedToRaw(ConversionContext* ctx);
+
 /* ---- pixel routines ---- */
 
 /* Swaps the rows of an image of `rows` rows of `rowBytes` bytes top to

@@ -7,7 +7,7 @@ FUZZ_BUILD ?= build-fuzz
 JOBS       ?= $(shell nproc 2>/dev/null || echo 2)
 CMAKE_GEN  := -G Ninja
 
-.PHONY: all deps build demo test bench sanitize fuzz fuzz-smoke clean
+.PHONY: all deps build demo test install check-install bench sanitize fuzz fuzz-smoke clean
 
 all: build
 
@@ -25,6 +25,17 @@ demo: build
 
 test: build
 	ctest --test-dir $(BUILD) --output-on-failure -j $(JOBS)
+
+# Installs headers, libraries, the tool, the CMake package and zantiff.pc
+# under PREFIX.
+PREFIX ?= /usr/local
+install: build
+	cmake --install $(BUILD) --prefix $(PREFIX)
+
+# Installs into a temporary prefix and builds and runs the example host
+# against it, with CMake and with pkg-config.
+check-install: build
+	@scripts/check-install.sh $(BUILD) samples/demo-multipage.tif
 
 bench: build
 	@scripts/run-bench.sh $(BUILD)

@@ -4,7 +4,6 @@
 // bilevel pixels in place.
 
 #include <algorithm>
-#include <cstdio>
 #include <cstring>
 
 #include "adapter.h"
@@ -77,9 +76,13 @@ public:
     }
 
 private:
-    template <typename... Args>
-    int Refuse(const char* format, Args... args) {
-        TIFFErrorExtR(tif_, TIFFFileName(tif_), format, args...);
+    // The reason, worded as libtiff's RGBA reader words it.
+    int Refuse(const char* reason) {
+        TIFFErrorExtR(tif_, TIFFFileName(tif_), "%s", reason);
+        return 0;
+    }
+    int Refuse(const char* format, int value) {
+        TIFFErrorExtR(tif_, TIFFFileName(tif_), format, value);
         return 0;
     }
 

@@ -9,11 +9,10 @@
 #include "frame/codec_messages.h"
 #include "frame/host_memory.h"
 #include "frame/io_procs.h"
+#include "frame/job_finishers.h"
 #include "frame/tiff_extent.h"
 #include "osttiff/osttiff.h"
 #include "pivlo/pivlo.h"
-#include "read/scanline_reader.h"
-#include "write/page_setup.h"
 #include "zantiff/zantiff.h"
 
 namespace zan {
@@ -220,13 +219,8 @@ extern "C" ZAN_API void zanDestroyTIFF(ConversionContext* ctx) {
     auto* decoder = static_cast<TIFFStreamDecoder*>(ctx->streamDecoder);
     ctx->streamDecoder = nullptr;
     TIFFStreamDecodeEnd(ctx, &decoder);
-    if (ctx->state == ZAN_STATE_WRITING && ctx->tiff) {
-        // The page in progress is finished as zanTIFFNextImage would.
-        FinishPage(ctx);
-    } else if (ctx->state == ZAN_STATE_READING) {
-        // The strip buffer, work line and palette copy of the scanline reader.
-        ReleaseReaderBuffers(ctx);
-    }
+    // A page being written is finished, a reader's buffers are given back.
+    FinishJobWork(ctx);
     if (ctx->sourceKind == ZAN_SOURCE_STREAM) CloseStreamBuffer(ctx);
     if (ctx->tiff) {
         TIFFClose(ctx->tiff);

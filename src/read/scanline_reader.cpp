@@ -9,6 +9,7 @@
 #include "frame/checked_size.h"
 #include "frame/codec_messages.h"
 #include "frame/host_memory.h"
+#include "frame/job_finishers.h"
 #include "frame/tiff_open.h"
 #include "osttiff/osttiff.h"
 #include "pivlo/pivlo.h"
@@ -27,6 +28,9 @@ namespace {
 bool UsesWorkLine(const ConversionContext* ctx) {
     return ctx->paletteExpansion || ctx->dropSampleCount || ctx->reduceTo8Bits;
 }
+
+// A job torn down while reading gives the reader's buffers back.
+const bool kReadingFinisher = RegisterJobFinisher(ZAN_STATE_READING, ReleaseReaderBuffers);
 
 }  // namespace
 

@@ -6,6 +6,7 @@
 #include <array>
 #include <cstdarg>
 
+#include "frame/job_finishers.h"
 #include "frame/tiff_open.h"
 #include "metadata/entry_forms.h"
 #include "metadata/metadata_writer.h"
@@ -78,6 +79,15 @@ int ApplyPageMetadata(ConversionContext* ctx, TIFF* tif) {
     }
     return 1;
 }
+
+namespace {
+
+// A job torn down while writing a page finishes it as zanTIFFNextImage would.
+const bool kWritingFinisher = RegisterJobFinisher(ZAN_STATE_WRITING, [](ConversionContext* ctx) {
+    if (ctx->tiff) FinishPage(ctx);
+});
+
+}  // namespace
 
 bool FinishPage(ConversionContext* ctx) {
     TIFF* tif = ctx->tiff;

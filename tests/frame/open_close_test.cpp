@@ -460,18 +460,28 @@ TEST(Teardown, PageInProgressIsWrittenOut) {
     EXPECT_EQ(pages[0].pixels, Bytes({1, 2, 3, 4, 5, 6, 7, 8, 1, 2, 3, 4, 5, 6, 7, 8}));
 }
 
+// A page left half read: its strip buffer, work line and palette copy go.
 TEST(Teardown, ReaderBuffersAreReleased) {
-    for (uint32_t palette : {0u, 1u}) {
+    FileSpec tiled;
+    tiled.pages[0].tileWidth = tiled.pages[0].tileHeight = 16;
+    FileSpec palette;
+    palette.pages[0].photometric = PHOTOMETRIC_PALETTE;
+    for (int i = 0; i < 768; ++i) palette.pages[0].colorMap.push_back(static_cast<uint16_t>(i * 85));
+    for (const FileSpec& spec : {tiled, palette}) {
+        const Bytes tiff = MakeTiff(spec);
         TestHost host;
-        host->state = ZAN_STATE_READING;
-        host->stripBuffer = static_cast<unsigned char*>(TestAllocator::Alloc(64));
-        host->frameData = TestAllocator::Alloc(32);
-        host->paletteExpansion = palette;
+        host->sourceKind = ZAN_SOURCE_MEMORY;
+        host->sourceMemory = tiff.data();
+        host->sourceMemorySize = static_cast<uint32_t>(tiff.size());
+        Bytes line(256);
+        TestAllocator::Reset();
+        ASSERT_NE(zanTIFFReadNextScanLine(host.ctx(), line.data(), static_cast<uint32_t>(line.size())), 0u);
+        EXPECT_NE(host->stripBuffer != nullptr, host->paletteRed != nullptr) << "the page's own buffers";
         zanDestroyTIFF(host.ctx());
         EXPECT_EQ(host->stripBuffer, nullptr);
-        EXPECT_EQ(host->frameData == nullptr, palette != 0)
-            << "the work line is released only when the reader expanded a palette";
-        EXPECT_EQ(TestAllocator::LiveBlocks(), palette ? 0u : 1u);
+        EXPECT_EQ(host->paletteRed, nullptr);
+        EXPECT_EQ(host->frameData, nullptr) << "the palette's work line";
+        EXPECT_EQ(TestAllocator::LiveBlocks(), 0u);
     }
 }
 

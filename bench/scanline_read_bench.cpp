@@ -1,5 +1,7 @@
-// Rows per second of zanTIFFReadNextScanLine against a plain libtiff
-// TIFFReadScanline loop on the same 4000 x 4000 files in the same run.
+// Rows per second of zanTIFFReadNextScanLine against libtiff on the same
+// 4000 x 4000 files in the same run: a TIFFReadScanline loop, followed for
+// the palette and 16-bit pages by the conversion the module does (RGB from
+// the ColorMap's high bytes; each 16-bit sample cut to its high byte).
 
 #include <benchmark/benchmark.h>
 
@@ -101,14 +103,47 @@ void Libtiff(benchmark::State& state, Kind kind) {
     state.SetItemsProcessed(state.iterations() * kSize);
 }
 
+// TIFFReadScanline and then what the module's lines hold: palette indices
+// looked up, 16-bit samples cut to 8 bits.
+void LibtiffConverting(benchmark::State& state, Kind kind) {
+    const std::string& path = InputFile(kind);
+    for (auto _ : state) {
+        TIFF* tif = TIFFOpen(path.c_str(), "r");
+        uint16_t *red = nullptr, *green = nullptr, *blue = nullptr;
+        TIFFGetField(tif, TIFFTAG_COLORMAP, &red, &green, &blue);
+        std::vector<uint8_t> line(static_cast<size_t>(TIFFScanlineSize(tif)));
+        std::vector<uint8_t> out(static_cast<size_t>(kSize) * 3);
+        for (uint32_t y = 0; y < kSize; ++y) {
+            if (TIFFReadScanline(tif, line.data(), y, 0) < 0) {
+                state.SkipWithError("read failed");
+                break;
+            }
+            if (kind == Kind::Palette8) {
+                for (uint32_t x = 0; x < kSize; ++x) {
+                    const uint8_t index = line[x];
+                    out[3 * x] = static_cast<uint8_t>(red[index] >> 8);
+                    out[3 * x + 1] = static_cast<uint8_t>(green[index] >> 8);
+                    out[3 * x + 2] = static_cast<uint8_t>(blue[index] >> 8);
+                }
+            } else {
+                const auto* samples = reinterpret_cast<const uint16_t*>(line.data());
+                for (size_t i = 0; i < out.size(); ++i) out[i] = static_cast<uint8_t>(samples[i] >> 8);
+            }
+            benchmark::DoNotOptimize(out.data());
+        }
+        TIFFClose(tif);
+    }
+    state.SetItemsProcessed(state.iterations() * kSize);
+}
+
 BENCHMARK_CAPTURE(Module, ReadRgb8, Kind::Rgb8)->Unit(benchmark::kMillisecond);
 BENCHMARK_CAPTURE(Libtiff, ReadRgb8, Kind::Rgb8)->Unit(benchmark::kMillisecond);
 BENCHMARK_CAPTURE(Module, ReadRgb8Lzw, Kind::Rgb8Lzw)->Unit(benchmark::kMillisecond);
 BENCHMARK_CAPTURE(Libtiff, ReadRgb8Lzw, Kind::Rgb8Lzw)->Unit(benchmark::kMillisecond);
 BENCHMARK_CAPTURE(Module, ReadRgb16To8, Kind::Rgb16)->Unit(benchmark::kMillisecond);
-BENCHMARK_CAPTURE(Libtiff, ReadRgb16To8, Kind::Rgb16)->Unit(benchmark::kMillisecond);
+BENCHMARK_CAPTURE(LibtiffConverting, ReadRgb16To8, Kind::Rgb16)->Unit(benchmark::kMillisecond);
 BENCHMARK_CAPTURE(Module, ReadPalette8, Kind::Palette8)->Unit(benchmark::kMillisecond);
-BENCHMARK_CAPTURE(Libtiff, ReadPalette8, Kind::Palette8)->Unit(benchmark::kMillisecond);
+BENCHMARK_CAPTURE(LibtiffConverting, ReadPalette8, Kind::Palette8)->Unit(benchmark::kMillisecond);
 
 }  // namespace
 

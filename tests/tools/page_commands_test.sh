@@ -32,4 +32,13 @@ grep -q "ImageDescription: set by the tool" <<<"$info" || fail "description not 
 grep -q "Resolution: 150" <<<"$info" || fail "resolution not set"
 grep -q "Page Number: 1-3" <<<"$info" || fail "page number not set"
 if "$tool" set-tags "$work/three.tif" NoSuchTag=1 2>/dev/null; then fail "unknown tag accepted"; fi
+# Several files at once (for batch jobs): each described or split, and the
+# status names the files that failed.
+"$tool" split "$work/three.tif" "$work/joined.tif" -o "$work/many_" >/dev/null
+[ -f "$work/many_three_0001.tif" ] && [ -f "$work/many_joined_0003.tif" ] || fail "split of several files"
+if "$tool" info "$work/three.tif" "$work/missing.tif" "$work/joined.tif" --json >"$work/out" 2>"$work/err"; then
+  fail "info with a missing file succeeded"
+fi
+grep -q "info failed for 1 of 3 file(s): $work/missing.tif" "$work/err" || fail "the failed file is not named"
+[ "$(grep -c '^{"file":' "$work/out")" = 2 ] || fail "info: not one line a file"
 echo "page commands: ok"

@@ -66,13 +66,22 @@ bool Job::HasError(const std::string& text) const {
     return std::find(errors_.begin(), errors_.end(), Trimmed(text.c_str())) != errors_.end();
 }
 
+int ReportFailures(const char* command, const std::vector<std::string>& failed, size_t files) {
+    if (failed.empty()) return 0;
+    std::fprintf(stderr, "zantiff: %s failed for %zu of %zu file(s):", command, failed.size(), files);
+    for (const std::string& name : failed) std::fprintf(stderr, " %s", name.c_str());
+    std::fputc('\n', stderr);
+    return 1;
+}
+
 File OpenFile(const std::string& path, const char* mode) {
     File file(std::fopen(path.c_str(), mode));
     if (!file) std::fprintf(stderr, "zantiff: cannot open %s: %s\n", path.c_str(), std::strerror(errno));
     return file;
 }
 
-Progress::Progress(std::string what) : what_(std::move(what)), terminal_(isatty(STDERR_FILENO) != 0) {}
+Progress::Progress(std::string what)
+    : what_(std::move(what)), terminal_(isatty(STDERR_FILENO) != 0), start_(std::chrono::steady_clock::now()) {}
 
 Progress::~Progress() {
     if (shown_) std::fputc('\n', stderr);
@@ -80,8 +89,14 @@ Progress::~Progress() {
 
 void Progress::Update(unsigned done, unsigned total) {
     if (!terminal_) return;
-    if (total) std::fprintf(stderr, "\r%s %u/%u", what_.c_str(), done, total);
-    else std::fprintf(stderr, "\r%s %u", what_.c_str(), done);
+    const auto now = std::chrono::steady_clock::now();
+    const bool last = total && done == total;
+    if (shown_ && !last && now - last_ < std::chrono::milliseconds(100)) return;
+    last_ = now;
+    const double seconds = std::chrono::duration<double>(now - start_).count();
+    const double rate = seconds > 0 ? done / seconds : 0;
+    if (total) std::fprintf(stderr, "\r%s %u/%u, %.1f/s   ", what_.c_str(), done, total, rate);
+    else std::fprintf(stderr, "\r%s %u, %.1f/s   ", what_.c_str(), done, rate);
     std::fflush(stderr);
     shown_ = true;
 }

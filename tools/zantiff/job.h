@@ -2,6 +2,7 @@
 // reference host, files that close themselves, and a progress line.
 #pragma once
 
+#include <chrono>
 #include <cstdio>
 #include <memory>
 #include <string>
@@ -52,10 +53,17 @@ struct FileCloser {
 };
 using File = std::unique_ptr<FILE, FileCloser>;
 
+// After a command over several files: names each file that failed on
+// standard error; the command's status (1 when any failed).
+int ReportFailures(const char* command, const std::vector<std::string>& failed, size_t files);
+
 // Opens a file or prints why it cannot be opened.
 File OpenFile(const std::string& path, const char* mode);
 
-// A one-line progress report on standard error, shown only on a terminal.
+// A one-line progress report on standard error, shown only on a terminal:
+// "<what> done/total, rate per second". `what` names the command and its
+// unit ("split: page"). Updates come at most ten times a second (and the
+// last one always).
 class Progress {
 public:
     explicit Progress(std::string what);
@@ -66,6 +74,7 @@ private:
     std::string what_;
     bool shown_ = false;
     bool terminal_;
+    std::chrono::steady_clock::time_point start_, last_;
 };
 
 }  // namespace zantool

@@ -14,8 +14,6 @@
 namespace zantool {
 namespace {
 
-constexpr char kPageBeyond[] = "Specified page beyond that of the source tiff file.";
-
 int Append(const std::string& dest, const std::vector<std::string>& sources) {
     Progress progress("append: file");
     unsigned done = 0;
@@ -66,23 +64,50 @@ std::string SplitName(const std::string& prefix, unsigned page) {
     return prefix + number + ".tif";
 }
 
-int Split(const std::string& source, const std::string& prefix) {
+// The pages of `source` as the module counts them; 0 after its messages.
+unsigned CountPages(const std::string& source) {
+    File in = OpenFile(source, "rb");
+    if (!in) return 0;
+    Job job;
+    job->sourceKind = ZAN_SOURCE_FILE;
+    job->sourceFp = in.get();
+    job->pageNumber = 1;
+    return zanTIFFGetInfo(job.get()) ? job->pageCount : 0;
+}
+
+// Every page of `source` into PREFIX0001.tif, PREFIX0002.tif, ...
+bool SplitOne(const std::string& source, const std::string& prefix) {
+    const unsigned pages = CountPages(source);
+    if (pages == 0) return false;
     Progress progress("split: page");
-    for (unsigned page = 1;; ++page) {
+    for (unsigned page = 1; page <= pages; ++page) {
         const std::string out = SplitName(prefix, page);
         Job job;
-        job.Quiet();
         if (!ExtractInto(source, static_cast<int>(page), out, job)) {
             std::remove(out.c_str());
-            if (page > 1 && job.HasError(kPageBeyond)) {
-                std::printf("%u page(s) written as %s0001.tif ...\n", page - 1, prefix.c_str());
-                return 0;
-            }
-            job.Print();
-            return 1;
+            return false;
         }
-        progress.Update(page);
+        progress.Update(page, pages);
     }
+    std::printf("%s: %u page(s) written as %s0001.tif ...\n", source.c_str(), pages, prefix.c_str());
+    return true;
+}
+
+// The name of a file without its folders and its extension.
+std::string Stem(const std::string& path) {
+    const size_t slash = path.find_last_of('/');
+    std::string name = slash == std::string::npos ? path : path.substr(slash + 1);
+    const size_t dot = name.find_last_of('.');
+    return dot == std::string::npos || dot == 0 ? name : name.substr(0, dot);
+}
+
+// One source: PREFIX0001.tif, ...; several (or `byName`): PREFIX<stem>_0001.tif, ...
+int Split(const std::vector<std::string>& sources, const std::string& prefix, bool byName) {
+    std::vector<std::string> failed;
+    const bool named = byName || sources.size() > 1;
+    for (const std::string& source : sources)
+        if (!SplitOne(source, named ? prefix + Stem(source) + "_" : prefix)) failed.push_back(source);
+    return ReportFailures("split", failed, sources.size());
 }
 
 // ---- set-tags ----
@@ -213,6 +238,7 @@ struct PageArguments {
     std::string dest, source, output;
     std::vector<std::string> sources, assignments;
     int page = 1;
+    bool byName = false;
 };
 
 }  // namespace
@@ -232,9 +258,12 @@ void AddPageCommands(CLI::App& app, int& status) {
     extract->callback([&status] { status = Extract(args.source, args.page, args.output); });
 
     auto* split = app.add_subcommand("split", "Write every page into a file of its own");
-    split->add_option("SRC", args.source, "TIFF file")->required();
-    split->add_option("-o,--output", args.output, "prefix of the files: PREFIX0001.tif, ...")->required();
-    split->callback([&status] { status = Split(args.source, args.output); });
+    split->add_option("SRC", args.sources, "TIFF files")->required();
+    split->add_option("-o,--output", args.output,
+                      "prefix of the files: PREFIX0001.tif, ... (several sources: PREFIX<name>_0001.tif, ...)")
+        ->required();
+    split->add_flag("--by-name", args.byName, "name the files after their source even for one (batch jobs)");
+    split->callback([&status] { status = Split(args.sources, args.output, args.byName); });
 
     auto* setTags = app.add_subcommand("set-tags", "Change tags of the first page in place");
     setTags->add_option("FILE", args.source, "TIFF file to change")->required();

@@ -138,7 +138,7 @@ bool CopyRows(ConversionContext* writer, ConversionContext* page) {
 }  // namespace
 
 uint32_t CopyPages(const std::string& source, ConversionContext* writer, const CopyOptions& options,
-                   bool* failed) {
+                   bool* failed, const std::function<void(uint32_t, uint32_t)>& progress) {
     *failed = false;
     FILE* file = std::fopen(source.c_str(), "rb");
     if (!file) {
@@ -167,6 +167,7 @@ uint32_t CopyPages(const std::string& source, ConversionContext* writer, const C
         writer->writeMetadataList = nullptr;
         if (!ok) break;
         ++copied;
+        if (progress) progress(copied, pages);
     }
     std::fclose(file);
     *failed = copied < pages;

@@ -3,6 +3,7 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <string>
 
 #include "zantiff/zantiff.h"
@@ -19,7 +20,8 @@ struct CopyOptions {
 // with its metadata, written line by line with it, and closed with
 // zanTIFFNextImage. Messages go where the writer's go. Returns the number
 // of pages copied; stops at the first page that fails (*failed is set).
+// `progress`, when given, hears of each page copied (pages done, pages).
 uint32_t CopyPages(const std::string& source, ConversionContext* writer, const CopyOptions& options,
-                   bool* failed);
+                   bool* failed, const std::function<void(uint32_t, uint32_t)>& progress = {});
 
 }  // namespace zantool

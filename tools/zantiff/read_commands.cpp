@@ -165,9 +165,12 @@ void PrintText(const ordered_json& info) {
     }
 }
 
-int Info(const std::string& path, int page, bool json) {
+// One file's description: pretty JSON or text for a single file; for
+// several (`several`), one JSON document a line ("file" naming it) or text
+// under a "file:" line.
+bool InfoOne(const std::string& path, int page, bool json, bool several) {
     File in = OpenFile(path, "rb");
-    if (!in) return 1;
+    if (!in) return false;
     Job job;
     MetadataList* list = pivloCreateMetadataList(nullptr, nullptr);
     job->sourceKind = ZAN_SOURCE_FILE;
@@ -176,13 +179,28 @@ int Info(const std::string& path, int page, bool json) {
     job->metadataList = list;
     const int described = zanTIFFGetInfo(job.get());
     if (described) {
-        const ordered_json info = Describe(job.get(), page, list, TagNames(path));
-        if (json) std::printf("%s\n", info.dump(2).c_str());
-        else PrintText(info);
+        ordered_json info = Describe(job.get(), page, list, TagNames(path));
+        if (several && json) {
+            ordered_json line = {{"file", path}};
+            line.update(info);
+            std::printf("%s\n", line.dump().c_str());
+        } else if (json) {
+            std::printf("%s\n", info.dump(2).c_str());
+        } else {
+            if (several) std::printf("file:              %s\n", path.c_str());
+            PrintText(info);
+        }
     }
     job->metadataList = nullptr;
     pivloDestroyMetadataList(list);
-    return described ? 0 : 1;
+    return described != 0;
+}
+
+int Info(const std::vector<std::string>& paths, int page, bool json, bool lines) {
+    std::vector<std::string> failed;
+    for (const std::string& path : paths)
+        if (!InfoOne(path, page, json || lines, lines || paths.size() > 1)) failed.push_back(path);
+    return ReportFailures("info", failed, paths.size());
 }
 
 // ---- decode ----
@@ -421,9 +439,11 @@ int PassThrough(const std::string& path, int page, const std::string& outPath, u
 }
 
 struct ReadArguments {
+    std::vector<std::string> files;
     std::string file, output;
     int page = 1;
     bool json = false;
+    bool jsonLines = false;
     bool frame = false;
     bool stream = false;
     uint32_t chunk = 64 << 10;
@@ -434,10 +454,11 @@ struct ReadArguments {
 void AddReadCommands(CLI::App& app, int& status) {
     static ReadArguments args;
     auto* info = app.add_subcommand("info", "Describe a page and list its metadata and EXIF tags");
-    info->add_option("FILE", args.file, "TIFF file")->required();
+    info->add_option("FILE", args.files, "TIFF files")->required();
     info->add_option("-p,--page", args.page, "page number, from 1");
-    info->add_flag("--json", args.json, "print JSON");
-    info->callback([&status] { status = Info(args.file, args.page, args.json); });
+    info->add_flag("--json", args.json, "print JSON (several files: one document a line)");
+    info->add_flag("--jsonl", args.jsonLines, "one JSON document a line, naming its file, even for one file");
+    info->callback([&status] { status = Info(args.files, args.page, args.json, args.jsonLines); });
 
     auto* decode = app.add_subcommand("decode", "Write a page's lines as PNG (separated pages as PAM)");
     decode->add_option("FILE", args.file, "TIFF file")->required();

@@ -172,7 +172,9 @@ int Copy(const WriteArguments& args) {
     Job job;
     if (!UseFileDestination(job, args.output, false)) return 1;
     bool failed = false;
-    const uint32_t pages = CopyPages(args.input, job.get(), options, &failed);
+    Progress progress("copy: page");
+    const uint32_t pages = CopyPages(args.input, job.get(), options, &failed,
+                                     [&progress](uint32_t done, uint32_t total) { progress.Update(done, total); });
     zanDestroyTIFF(job.get());
     CloseDestination(job);
     if (!failed) std::printf("%u page(s) copied\n", pages);

@@ -7,7 +7,7 @@ FUZZ_BUILD ?= build-fuzz
 JOBS       ?= $(shell nproc 2>/dev/null || echo 2)
 CMAKE_GEN  := -G Ninja
 
-.PHONY: all deps build demo test install check-install bench sanitize fuzz fuzz-smoke clean
+.PHONY: all deps build demo test install check-install bench coverage sanitize fuzz fuzz-smoke clean
 
 all: build
 
@@ -39,6 +39,10 @@ check-install: build
 
 bench: build
 	@scripts/run-bench.sh $(BUILD)
+
+# Line and function coverage of src/ by the test suite (gcov, lcov).
+coverage: deps
+	@scripts/coverage.sh build-cov
 
 # The whole suite again under AddressSanitizer and UndefinedBehaviorSanitizer,
 # leak detection on.

@@ -23,6 +23,13 @@ struct MessageSlots {
 };
 
 MessageSlots gSlots;
+// The handlers in force before any job redirected the codec's messages. A
+// job that starts while another job's redirection is in force saves these,
+// not the module's own forwarding handlers: otherwise, once both jobs end,
+// the forwarding handlers (with no sinks left) would stay in force for good
+// and every later libtiff message of the process would be lost.
+TIFFErrorHandler gOriginalError = nullptr;
+TIFFErrorHandler gOriginalWarning = nullptr;
 uint64_t gErrorsDelivered = 0;
 
 constexpr const char kOverrunNotice[] = "DANGER OUTPUT MESSAGE BUFFER OVERRUN";
@@ -101,8 +108,12 @@ void RedirectCodecMessages(ConversionContext* ctx) {
     const TIFFErrorHandler previousWarning =
         TIFFSetWarningHandler(WarningSinkSet() ? CodecWarningToHost : nullptr);
     if (gSlots.owner == ctx) return;  // keep what was in force before this job
-    ctx->savedErrorHandler = previousError;
-    ctx->savedWarningHandler = previousWarning;
+    if (!gSlots.owner) {
+        gOriginalError = previousError;
+        gOriginalWarning = previousWarning;
+    }
+    ctx->savedErrorHandler = gOriginalError;
+    ctx->savedWarningHandler = gOriginalWarning;
     gSlots.owner = ctx;
 }
 

@@ -96,7 +96,12 @@ void RawDelivery::Finish() {
     } else if (ctx_->destKind == ZAN_DEST_FIXED_BUFFER) {
         if (ctx_->destSizeOut) *ctx_->destSizeOut = static_cast<uint32_t>(written_);
     } else if (ctx_->destKind != ZAN_DEST_CALLBACKS) {
-        // The block goes as it was taken: of the bound Begin was given.
+        // The block goes to the host holding exactly the bytes delivered (the
+        // bound Begin was given may be larger); should the host not shrink
+        // it, the larger block goes, with the same size reported.
+        if (written_ > 0 && written_ < capacity_ && ctx_->reallocProc)
+            if (void* shrunk = ctx_->reallocProc(block_, static_cast<uint32_t>(written_)))
+                block_ = static_cast<uint8_t*>(shrunk);
         if (ctx_->destMemory) *static_cast<void**>(ctx_->destMemory) = block_;
         else ReleaseBlock(ctx_, block_);
         if (ctx_->destSizeOut) *ctx_->destSizeOut = static_cast<uint32_t>(written_);

@@ -1,4 +1,4 @@
-// libzantiff.so exports the module's zan functions and nothing else.
+// libzantiff.so exports the module's 22 zan functions and nothing else.
 
 #include <gtest/gtest.h>
 
@@ -17,23 +17,18 @@ const std::set<std::string> kInterface = {
     "zanTIFFWriteNextScanLine", "zanFrameBufferToTIFF", "zanG4ToTIFF", "zanJPEGToTIFF",
     "zanTIFFSetTIFFTags", "zanConcatenateTIFF", "zanExtractTIFFPage", "zanDestroyTIFF"};
 
-TEST(Exports, SharedLibraryExportsOnlyInterfaceFunctions) {
+// A host linking the library finds exactly these names defined.
+TEST(Exports, SharedLibraryExportsExactlyTheInterfaceFunctions) {
     ASSERT_EQ(kInterface.size(), 22u);
     const std::string command = std::string("nm -D --defined-only ") + ZANTIFF_SHARED_LIBRARY;
     FILE* pipe = popen(command.c_str(), "r");
     ASSERT_NE(pipe, nullptr);
     std::set<std::string> exported;
-    char line[512];
-    while (std::fgets(line, sizeof line, pipe)) {
-        char type = 0;
-        char name[400] = {0};
-        if (std::sscanf(line, "%*s %c %399s", &type, name) == 2) exported.insert(name);
-    }
+    char line[512], name[400];
+    while (std::fgets(line, sizeof line, pipe))
+        if (std::sscanf(line, "%*s %*c %399s", name) == 1) exported.insert(name);
     ASSERT_EQ(pclose(pipe), 0);
-    ASSERT_FALSE(exported.empty());
-    for (const auto& name : exported) EXPECT_TRUE(kInterface.count(name)) << name << " is exported";
-    EXPECT_TRUE(exported.count("zanGetTiffVersion"));
-    EXPECT_TRUE(exported.count("zanDestroyTIFF"));
+    EXPECT_EQ(exported, kInterface);
 }
 
 }  // namespace

@@ -4,61 +4,46 @@
 
 #include <cstring>
 #include <string>
-#include <vector>
 
 #include "frame/io_procs.h"
+#include "frame_support.h"
 #include "support/test_host.h"
 
 namespace {
 
 using namespace zan;
-using zantest::TestAllocator;
-using zantest::TestHost;
+using namespace zantest;
 
-std::string Text(const void* bytes, size_t n) { return std::string(static_cast<const char*>(bytes), n); }
-char* Chars(const char* s) { return const_cast<char*>(s); }
-constexpr uint32_t Back(uint32_t n) { return 0u - n; }  // a backward move as a wrapped offset
+char* Chars(const std::string& s) { return const_cast<char*>(s.c_str()); }
+int32_t Size(const std::string& s) { return static_cast<int32_t>(s.size()); }
 
-// A memory source over the ten bytes "abcdefghij".
-class MemorySourceTest : public ::testing::Test {
-protected:
-    void SetUp() override {
-        host_->memBase = host_->memPos = data_;
-        host_->memCapacity = host_->memSize = sizeof data_;
-    }
-    TestHost host_;
-    ConversionContext* c_ = host_.ctx();
-    unsigned char data_[10] = {'a', 'b', 'c', 'd', 'e', 'f', 'g', 'h', 'i', 'j'};
-};
-
-// Reads and the size stop at the end of the data; the image is never mapped.
-TEST_F(MemorySourceTest, ReadsAndSizeStopAtTheEndOfTheData) {
+// Reads and the size of a memory source stop at the end of its data; seeks
+// wrap in 32 bits without a bound check; the image is never mapped.
+TEST(MemorySource, ReadsStopAtTheEndOfTheDataAndSeeksWrap) {
+    TestHost host;
+    ConversionContext* c = host.ctx();
+    unsigned char data[] = {'a', 'b', 'c', 'd', 'e', 'f', 'g', 'h', 'i', 'j'};
+    host->memBase = host->memPos = data;
+    host->memCapacity = host->memSize = sizeof data;
     char out[16] = {};
-    EXPECT_EQ(MemReadProc(c_, out, 4), 4);
+    EXPECT_EQ(MemReadProc(c, out, 4), 4);
     EXPECT_EQ(Text(out, 4), "abcd");
-    MemSeekProc(c_, 7, SEEK_SET);
-    EXPECT_EQ(MemReadProc(c_, out, 8), 3) << "a read crossing the end returns what is left";
+    ExpectSeeks(MemSeekProc, c, {{6, SEEK_SET, 6}, {Back(4), SEEK_CUR, 2}});
+    EXPECT_EQ(MemReadProc(c, out, 1), 1);
+    EXPECT_EQ(out[0], 'c');
+    MemSeekProc(c, 7, SEEK_SET);
+    EXPECT_EQ(MemReadProc(c, out, 8), 3) << "a read crossing the end returns what is left";
     EXPECT_EQ(Text(out, 3), "hij");
-    EXPECT_EQ(MemReadProc(c_, out, 8), 0);
-    EXPECT_EQ(MemSeekProc(c_, 0, SEEK_CUR), 10u) << "a read at the end does not move";
-    EXPECT_EQ(MemReadProc(c_, out, 0), 0);
-    EXPECT_EQ(MemReadProc(c_, out, -5), 0);
-    EXPECT_EQ(MemSizeProc(c_), 10u);
+    EXPECT_EQ(MemReadProc(c, out, 8), 0);
+    EXPECT_EQ(MemReadProc(c, out, 0), 0);
+    EXPECT_EQ(MemReadProc(c, out, -5), 0);
+    EXPECT_EQ(MemSizeProc(c), 10u);
+    ExpectSeeks(MemSeekProc, c, {{0, SEEK_CUR, 10}, {Back(1), SEEK_END, 9}, {100, SEEK_SET, 100}});
+    EXPECT_EQ(MemReadProc(c, out, 1), 0);
+    ExpectSeeks(MemSeekProc, c, {{3, 7, 100}});
     void* base = nullptr;
     uint32_t size = 0;
-    EXPECT_EQ(MemMapProc(c_, &base, &size), 0);
-}
-
-TEST_F(MemorySourceTest, SeeksUse32BitArithmetic) {
-    EXPECT_EQ(MemSeekProc(c_, 6, SEEK_SET), 6u);
-    EXPECT_EQ(MemSeekProc(c_, Back(4), SEEK_CUR), 2u);
-    char c = 0;
-    EXPECT_EQ(MemReadProc(c_, &c, 1), 1);
-    EXPECT_EQ(c, 'c');
-    EXPECT_EQ(MemSeekProc(c_, Back(1), SEEK_END), 9u);
-    EXPECT_EQ(MemSeekProc(c_, 100, SEEK_SET), 100u) << "no bound check";
-    EXPECT_EQ(MemReadProc(c_, &c, 1), 0);
-    EXPECT_EQ(MemSeekProc(c_, 3, 7), 100u) << "unknown whence leaves the position";
+    EXPECT_EQ(MemMapProc(c, &base, &size), 0);
 }
 
 // A growing image in an 8-byte block of stale bytes.
@@ -76,17 +61,14 @@ protected:
         TestAllocator::Free(host_->memBase);
     }
     std::string Data() { return Text(host_->memBase, host_->memSize); }
-    int32_t Write(const std::string& s) {
-        return MemGrowWriteProc(c_, Chars(s.c_str()), static_cast<int32_t>(s.size()));
-    }
+    int32_t Write(const std::string& s) { return MemGrowWriteProc(c_, Chars(s), Size(s)); }
 
     TestHost host_;
     ConversionContext* c_ = host_.ctx();
 };
 
-// Bytes skipped by a seek, inside the block or beyond it, read back as zero;
-// overwriting inside the data keeps its size; after the block grows the
-// position keeps its distance; the image reads back whole.
+// Gaps a seek leaves read back as zero, inside the block or beyond it;
+// overwriting keeps the size; the position survives the block's growth.
 TEST_F(GrowingImageTest, WritesLandAtThePositionAndGapsAreZero) {
     Write("ab");
     MemSeekProc(c_, 5, SEEK_SET);
@@ -104,9 +86,8 @@ TEST_F(GrowingImageTest, WritesLandAtThePositionAndGapsAreZero) {
     EXPECT_EQ(MemReadProc(c_, out, 22), 22);
 }
 
-// A refused growth is a short write of what still fits in the block, with a
-// host error; the data never end past the block, even after a rewind. A
-// size beyond 32 bits is refused without a wrapped request to the host.
+// A refused growth is a short write of what still fits, with a host error,
+// even after a rewind; a size beyond 32 bits never reaches the host.
 TEST_F(GrowingImageTest, RefusedGrowthIsAShortWriteOfWhatStillFits) {
     Write("abc");
     TestAllocator::FailAll();
@@ -118,57 +99,34 @@ TEST_F(GrowingImageTest, RefusedGrowthIsAShortWriteOfWhatStillFits) {
     MemSeekProc(c_, 0xFFFFFF00u, SEEK_SET);
     EXPECT_EQ(Write(std::string(0x100, 'z')), 0);
     EXPECT_EQ(TestAllocator::Calls(), 0);
-    EXPECT_EQ(host_.Errors(), std::vector<std::string>(3, "Memory allocation error"));
+    EXPECT_EQ(host_.Errors(), Texts(3, "Memory allocation error"));
 }
 
-// The host's fixed buffer of 8 bytes, followed by two guard bytes.
-class FixedBufferTest : public ::testing::Test {
-protected:
-    void SetUp() override {
-        std::memset(buffer_, '#', sizeof buffer_);
-        host_->destMemory = host_->destMemPos = buffer_;
-        host_->destMemoryCapacity = 8;
-    }
-    int32_t Write(const char* s) { return FixedWriteProc(c_, Chars(s), static_cast<int32_t>(std::strlen(s))); }
-
-    TestHost host_;
-    ConversionContext* c_ = host_.ctx();
-    unsigned char buffer_[10];
-};
-
-// Bytes skipped by a seek are zeroed; writes are cut at the capacity.
-TEST_F(FixedBufferTest, WritesAreCutAtTheCapacityAndNeverOverflow) {
-    EXPECT_EQ(Write("ab"), 2);
-    FixedSeekProc(c_, 5, SEEK_SET);
-    EXPECT_EQ(Write("cdefg"), 3);
-    EXPECT_EQ(Write("k"), 0);
-    EXPECT_EQ(host_->memSize, 8u);
-    EXPECT_EQ(Text(buffer_, 10), Text("ab\0\0\0cde##", 10));
-}
-
-TEST_F(FixedBufferTest, ReadsNeedTheWholeCountToRemain) {
-    Write("abcdef");
-    FixedSeekProc(c_, 4, SEEK_SET);
+// The host's fixed buffer of 8 bytes and two guard bytes: seeks stay inside
+// it and its end is the end of the data; a read needs the whole count to
+// remain; skipped bytes are zeroed and writes cut at the capacity.
+TEST(FixedBuffer, SeeksEndAtTheDataAndWritesAreCutAtTheCapacity) {
+    TestHost host;
+    ConversionContext* c = host.ctx();
+    unsigned char buffer[10];
+    std::memset(buffer, '#', sizeof buffer);
+    host->destMemory = host->destMemPos = buffer;
+    host->destMemoryCapacity = 8;
+    auto write = [c](const std::string& s) { return FixedWriteProc(c, Chars(s), Size(s)); };
+    EXPECT_EQ(write("abcdef"), 6);
+    ExpectSeeks(FixedSeekProc, c,
+                {{8, SEEK_SET, 8}, {9, SEEK_SET, kSeekFailed}, {2, SEEK_SET, 2}, {6, SEEK_CUR, 8},
+                 {1, SEEK_CUR, kSeekFailed}, {0, 9, 0}, {3, SEEK_SET, 3}, {0, SEEK_END, 6},
+                 {Back(1), SEEK_END, kSeekFailed}, {1, SEEK_END, kSeekFailed}, {4, SEEK_SET, 4}});
     char out[8] = {};
-    EXPECT_EQ(FixedReadProc(c_, out, 5), 0) << "more than remains: nothing";
-    EXPECT_EQ(FixedReadProc(c_, out, 4), 4);
+    EXPECT_EQ(FixedReadProc(c, out, 5), 0) << "more than remains: nothing";
+    EXPECT_EQ(FixedReadProc(c, out, 4), 4);
     EXPECT_EQ(Text(out, 2), "ef");
-}
-
-// Seeks stay inside the capacity. The end is the end of the data written, so
-// appending after a look back does not overwrite what follows.
-TEST_F(FixedBufferTest, SeeksStayInsideTheBufferAndEndAtTheData) {
-    Write("abcdef");
-    EXPECT_EQ(FixedSeekProc(c_, 8, SEEK_SET), 8u);
-    EXPECT_EQ(FixedSeekProc(c_, 9, SEEK_SET), kSeekFailed);
-    EXPECT_EQ(FixedSeekProc(c_, 2, SEEK_SET), 2u);
-    EXPECT_EQ(FixedSeekProc(c_, 6, SEEK_CUR), 8u);
-    EXPECT_EQ(FixedSeekProc(c_, 1, SEEK_CUR), kSeekFailed);
-    EXPECT_EQ(FixedSeekProc(c_, 0, 9), 0u) << "unknown whence";
-    FixedSeekProc(c_, 3, SEEK_SET);
-    EXPECT_EQ(FixedSeekProc(c_, 0, SEEK_END), 6u);
-    EXPECT_EQ(FixedSeekProc(c_, Back(1), SEEK_END), kSeekFailed);
-    EXPECT_EQ(FixedSeekProc(c_, 1, SEEK_END), kSeekFailed);
+    FixedSeekProc(c, 7, SEEK_SET);
+    EXPECT_EQ(write("gh"), 1);
+    EXPECT_EQ(write("k"), 0);
+    EXPECT_EQ(host->memSize, 8u);
+    EXPECT_EQ(Text(buffer, 10), Text("abcdef\0g##", 10));
 }
 
 }  // namespace

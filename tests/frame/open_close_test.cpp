@@ -9,6 +9,7 @@
 #include <string>
 
 #include "frame/tiff_open.h"
+#include "frame_support.h"
 #include "osttiff/osttiff.h"
 #include "pivlo/pivlo.h"
 #include "support/memory_stream.h"
@@ -21,53 +22,31 @@ namespace {
 using namespace zantest;
 using zan::OpenTIFFForReading;
 using zan::OpenTIFFForWriting;
-using Texts = std::vector<std::string>;
-
-// Puts handlers of its own in force as the codec's process-wide ones for its
-// lifetime; InForce() tells whether they are the codec's again.
-struct HandlerProbe {
-    static void Error(const char*, const char*, va_list) {}
-    static void Warning(const char*, const char*, va_list) {}
-    TIFFErrorHandler savedError = TIFFSetErrorHandler(Error);
-    TIFFErrorHandler savedWarning = TIFFSetWarningHandler(Warning);
-    ~HandlerProbe() {
-        TIFFSetErrorHandler(savedError);
-        TIFFSetWarningHandler(savedWarning);
-    }
-    static bool InForce() {  // and leaves the handlers in force as they are
-        const TIFFErrorHandler error = TIFFSetErrorHandler(nullptr);
-        const TIFFErrorHandler warning = TIFFSetWarningHandler(nullptr);
-        TIFFSetErrorHandler(error);
-        TIFFSetWarningHandler(warning);
-        return error == Error && warning == Warning;
-    }
-};
 
 // Three pages: grey, wider grey, LZW-compressed RGB.
 FileSpec ThreePages() {
-    FileSpec spec;
-    spec.pages.assign(3, PageSpec{});
-    spec.pages[1].width = 24;
-    spec.pages[2].samplesPerPixel = 3;
-    spec.pages[2].photometric = PHOTOMETRIC_RGB;
-    spec.pages[2].compression = COMPRESSION_LZW;
-    return spec;
+    FileSpec file;
+    file.pages.assign(3, PageSpec{});
+    file.pages[1].width = 24;
+    file.pages[2].samplesPerPixel = 3;
+    file.pages[2].photometric = PHOTOMETRIC_RGB;
+    file.pages[2].compression = COMPRESSION_LZW;
+    return file;
 }
 
 // Every page of the codec object from its current directory on, decoded.
 std::vector<DecodedPage> DecodeAll(TIFF* tif) {
     std::vector<DecodedPage> pages;
     do {
-        DecodedPage page;
+        DecodedPage& page = pages.emplace_back();
         TIFFGetField(tif, TIFFTAG_IMAGEWIDTH, &page.width);
         TIFFGetField(tif, TIFFTAG_IMAGELENGTH, &page.height);
-        std::vector<uint8_t> strip(static_cast<size_t>(TIFFStripSize(tif)));
+        Bytes strip(static_cast<size_t>(TIFFStripSize(tif)));
         for (uint32_t s = 0; s < TIFFNumberOfStrips(tif); ++s) {
             const tmsize_t n = TIFFReadEncodedStrip(tif, s, strip.data(), -1);
             if (n < 0) return {};
             page.pixels.insert(page.pixels.end(), strip.begin(), strip.begin() + n);
         }
-        pages.push_back(std::move(page));
     } while (TIFFReadDirectory(tif));
     return pages;
 }
@@ -83,34 +62,26 @@ constexpr SourceKind kSources[] = {SourceKind::File, SourceKind::Memory, SourceK
                                    SourceKind::StreamBuffer};
 const char* const kSourceNames[] = {"File", "Memory", "Callbacks", "StreamBuffer"};
 
-// Binds a TestHost's source to `bytes` in the chosen way, keeps what the
-// source needs alive, and ends the job before letting go of it.
+// Binds a TestHost's source to `bytes` in the chosen way (a file holds them
+// after 5 bytes of something else), keeps what the source needs alive, and
+// ends the job before letting go of it.
 class SourceFixture {
 public:
     SourceFixture(TestHost& host, SourceKind kind, const Bytes& bytes) : host_(host), bytes_(bytes) {
-        ConversionContext* ctx = host.ctx();
-        switch (kind) {
-        case SourceKind::File: {
-            // The TIFF sits after 5 bytes of something else in the file.
+        if (kind == SourceKind::File) {
             Bytes padded(5 + bytes.size(), '!');
             std::copy(bytes.begin(), bytes.end(), padded.begin() + 5);
             WriteFileBytes(file_.path(), padded);
-            fp_ = std::fopen(file_.c_str(), "rb");
-            ctx->sourceKind = ZAN_SOURCE_FILE;
-            ctx->sourceFp = fp_;
-            ctx->sourceBaseOffset = 5;
-            break;
-        }
-        case SourceKind::Memory:
-            ctx->sourceKind = ZAN_SOURCE_MEMORY;
-            ctx->sourceMemory = bytes_.data();
-            ctx->sourceMemorySize = static_cast<uint32_t>(bytes_.size());
-            break;
-        case SourceKind::Callbacks:
-        case SourceKind::StreamBuffer:
+            host->sourceKind = ZAN_SOURCE_FILE;
+            host->sourceFp = fp_ = std::fopen(file_.c_str(), "rb");
+            host->sourceBaseOffset = 5;
+        } else if (kind == SourceKind::Memory) {
+            host->sourceKind = ZAN_SOURCE_MEMORY;
+            host->sourceMemory = bytes_.data();
+            host->sourceMemorySize = static_cast<uint32_t>(bytes_.size());
+        } else {
             stream_.data = bytes;
-            UseStreamSource(ctx, &stream_, kind == SourceKind::Callbacks);
-            break;
+            UseStreamSource(host.ctx(), &stream_, kind == SourceKind::Callbacks);
         }
     }
     ~SourceFixture() {
@@ -119,6 +90,7 @@ public:
     }
     FILE* fp() const { return fp_; }
     MemoryStream& stream() { return stream_; }
+    const Bytes& bytes() const { return bytes_; }
 
 private:
     TestHost& host_;
@@ -131,45 +103,43 @@ private:
 enum class DestKind { FileReopened, FileAsIs, Callbacks, FixedBuffer, GrowingMemory };
 constexpr DestKind kDests[] = {DestKind::FileReopened, DestKind::FileAsIs, DestKind::Callbacks,
                                DestKind::FixedBuffer, DestKind::GrowingMemory};
-const char* const kDestNames[] = {"FileReopened", "FileAsIs", "Callbacks", "FixedBuffer",
-                                  "GrowingMemory"};
+const char* const kDestNames[] = {"FileReopened", "FileAsIs", "Callbacks", "FixedBuffer", "GrowingMemory"};
 
 // A destination of the chosen kind for a TestHost, and the bytes it holds
-// once the job has ended (which its destructor makes sure of). A fixed
-// buffer is followed by guard bytes.
+// once the job has ended (which its destructor makes sure of). A file handed
+// in read-only must be reopened from its path; a fixed buffer is followed by
+// guard bytes.
 class DestinationFixture {
 public:
     DestinationFixture(TestHost& host, DestKind kind, uint32_t fixedCapacity = 1 << 20)
         : host_(host), kind_(kind), fixed_(fixedCapacity + kGuard, kGuardByte) {
-        ConversionContext* ctx = host.ctx();
         switch (kind) {
         case DestKind::FileReopened:
         case DestKind::FileAsIs:
             WriteFileBytes(file_.path(), {});
-            ctx->destKind = ZAN_DEST_FILE;
-            ctx->destPath = file_.c_str();
-            // Read-only when reopened: writing works only through the module's own stream.
-            ctx->destFp = std::fopen(file_.c_str(), kind == DestKind::FileAsIs ? "w+b" : "rb");
-            if (kind == DestKind::FileAsIs) ctx->destFileFlags = ZAN_DEST_FILE_USE_AS_IS;
+            host->destKind = ZAN_DEST_FILE;
+            host->destPath = file_.c_str();
+            host->destFp = std::fopen(file_.c_str(), kind == DestKind::FileAsIs ? "w+b" : "rb");
+            if (kind == DestKind::FileAsIs) host->destFileFlags = ZAN_DEST_FILE_USE_AS_IS;
             break;
         case DestKind::Callbacks:
-            ctx->destKind = ZAN_DEST_CALLBACKS;
-            ctx->destWriteProc = MemoryStream::Write;
-            ctx->destSeekProc = MemoryStream::Seek;
-            ctx->destUserData = &stream_;
-            ctx->sourceReadProc = MemoryStream::Read;  // read-back of what was written
-            ctx->sourceUserData = &stream_;
+            host->destKind = ZAN_DEST_CALLBACKS;
+            host->destWriteProc = MemoryStream::Write;
+            host->destSeekProc = MemoryStream::Seek;
+            host->destUserData = &stream_;
+            host->sourceReadProc = MemoryStream::Read;  // read-back of what was written
+            host->sourceUserData = &stream_;
             break;
         case DestKind::FixedBuffer:
-            ctx->destKind = ZAN_DEST_FIXED_BUFFER;
-            ctx->destMemory = fixed_.data();
-            ctx->destMemoryCapacity = fixedCapacity;
-            ctx->destSizeOut = &size_;
+            host->destKind = ZAN_DEST_FIXED_BUFFER;
+            host->destMemory = fixed_.data();
+            host->destMemoryCapacity = fixedCapacity;
+            host->destSizeOut = &size_;
             break;
         case DestKind::GrowingMemory:
-            ctx->destKind = ZAN_DEST_MEMORY;
-            ctx->destMemory = &block_;
-            ctx->destSizeOut = &size_;
+            host->destKind = ZAN_DEST_MEMORY;
+            host->destMemory = &block_;
+            host->destSizeOut = &size_;
             break;
         }
     }
@@ -180,33 +150,31 @@ public:
         if (block_ != kUnset) TestAllocator::Free(block_);  // the handed-over image
     }
 
+    // Puts `bytes` in the destination as a file already there.
+    void Preload(const Bytes& bytes) {
+        if (kind_ == DestKind::Callbacks) stream_.data = bytes;
+        else if (kind_ == DestKind::FixedBuffer) std::copy(bytes.begin(), bytes.end(), fixed_.begin());
+        else WriteFileBytes(file_.path(), bytes);
+    }
     // The bytes written, after the job has ended.
     Bytes Written() {
         switch (kind_) {
-        case DestKind::FileReopened:
-        case DestKind::FileAsIs:
-            std::fflush(host_->destFp);
-            return ReadFileBytes(file_.path());
-        case DestKind::Callbacks:
-            return stream_.data;
-        case DestKind::FixedBuffer:
-            return Bytes(fixed_.begin(), fixed_.begin() + size_);
+        case DestKind::Callbacks: return stream_.data;
+        case DestKind::FixedBuffer: return Bytes(fixed_.begin(), fixed_.begin() + size_);
         case DestKind::GrowingMemory:
             if (!block_ || block_ == kUnset) return {};
             return Bytes(static_cast<uint8_t*>(block_), static_cast<uint8_t*>(block_) + size_);
+        default:
+            std::fflush(host_->destFp);
+            return ReadFileBytes(file_.path());
         }
-        return {};
     }
     bool GuardIntact() const {
         return std::all_of(fixed_.end() - kGuard, fixed_.end(), [](uint8_t b) { return b == kGuardByte; });
     }
-    MemoryStream& stream() { return stream_; }
-    // Puts `bytes` at the start of the fixed buffer, as a file already there.
-    void Preload(const Bytes& bytes) { std::copy(bytes.begin(), bytes.end(), fixed_.begin()); }
     void* block() const { return block_; }
     void Forget() { block_ = nullptr; }
     uint32_t size() const { return size_; }
-    const TempFile& file() const { return file_; }
 
 private:
     static constexpr size_t kGuard = 16;
@@ -223,42 +191,39 @@ private:
 };
 
 // An open object (or a page already described) counts as open: the same
-// object comes back, whatever the kind now says, without touching the source
-// or saving the handlers anew (the codec's come back at teardown).
-TEST(OpenTIFF, OpenJobIsNotOpenedAgain) {
+// object comes back, whatever the kind now says, without touching the
+// source. An unknown kind fails without a message, and a job left with
+// nothing open can be torn down twice. The codec's handlers come back.
+TEST(OpenTIFF, OpenJobIsNotOpenedAgainAndUnknownKindsFailQuietly) {
     HandlerProbe probe;
-    TestHost reader;
-    SourceFixture source(reader, SourceKind::Callbacks, MakePages(1));
-    ASSERT_EQ(OpenTIFFForReading(reader.ctx()), 1);
-    TIFF* const read = reader->tiff;
-    const int reads = source.stream().reads;
-    reader->sourceKind = 99;
-    EXPECT_EQ(OpenTIFFForReading(reader.ctx()), 1);
-    EXPECT_EQ(reader->tiff, read);
-    EXPECT_EQ(source.stream().reads, reads);
-    reader.EndJob();
+    {
+        TestHost reader;
+        SourceFixture source(reader, SourceKind::Callbacks, MakePages(1));
+        ASSERT_EQ(OpenTIFFForReading(reader.ctx()), 1);
+        TIFF* const read = reader->tiff;
+        const int reads = source.stream().reads;
+        reader->sourceKind = 99;
+        EXPECT_EQ(OpenTIFFForReading(reader.ctx()), 1);
+        EXPECT_EQ(reader->tiff, read);
+        EXPECT_EQ(source.stream().reads, reads);
+    }
     EXPECT_TRUE(HandlerProbe::InForce());
-
-    TestHost described;
-    described->state = ZAN_STATE_DESCRIBED;
-    described->sourceKind = 99;
-    EXPECT_EQ(OpenTIFFForReading(described.ctx()), 1);
-    EXPECT_EQ(described->tiff, nullptr);
-
-    TestHost writer;
-    DestinationFixture dest(writer, DestKind::GrowingMemory);
-    ASSERT_EQ(OpenTIFFForWriting(writer.ctx()), 1);
-    TIFF* const written = writer->tiff;
-    writer->destKind = 42;
-    EXPECT_EQ(OpenTIFFForWriting(writer.ctx()), 1);
-    EXPECT_EQ(writer->tiff, written);
-    writer->destKind = ZAN_DEST_MEMORY;
-}
-
-// A job left with nothing open can also be torn down twice.
-TEST(OpenTIFF, UnknownSourceOrDestinationKindFailsWithoutAMessage) {
-    HandlerProbe probe;
+    {
+        TestHost writer;
+        DestinationFixture dest(writer, DestKind::GrowingMemory);
+        ASSERT_EQ(OpenTIFFForWriting(writer.ctx()), 1);
+        TIFF* const written = writer->tiff;
+        writer->destKind = 42;
+        EXPECT_EQ(OpenTIFFForWriting(writer.ctx()), 1);
+        EXPECT_EQ(writer->tiff, written);
+        writer->destKind = ZAN_DEST_MEMORY;
+    }
     TestHost host;
+    host->state = ZAN_STATE_DESCRIBED;
+    host->sourceKind = 99;
+    EXPECT_EQ(OpenTIFFForReading(host.ctx()), 1);
+    EXPECT_EQ(host->tiff, nullptr);
+    host->state = 0;
     for (uint32_t kind : {0u, 3u, 5u}) {
         host->sourceKind = kind;
         EXPECT_EQ(OpenTIFFForReading(host.ctx()), 0);
@@ -319,55 +284,48 @@ TEST(ReadingOpen, SourceThatCannotBeOpenedIsRefusedAndNothingIsHeld) {
     }
 }
 
-// ---------------------------------------------------------------- writing
-
-TEST(WritingOpen, AppendModeAddsPagesToAnExistingFile) {
-    // A fixed buffer's file ends where its structure says, not where the
-    // buffer does.
-    for (DestKind kind : {DestKind::FileReopened, DestKind::Callbacks, DestKind::FixedBuffer}) {
-        SCOPED_TRACE(kDestNames[static_cast<int>(kind)]);
+// In append mode a second page lands behind the file the destination holds
+// (a fixed buffer's file ends where its structure says, not where the buffer
+// does). A callback destination that cannot read back fails at the second
+// page with the reason, its first page still readable.
+TEST(WritingOpen, SecondPageGoesBehindTheFirstOrFailsWithoutReadBack) {
+    const std::pair<DestKind, bool> cases[] = {
+        {DestKind::FileReopened, true}, {DestKind::Callbacks, true}, {DestKind::FixedBuffer, true},
+        {DestKind::Callbacks, false}};
+    for (const auto& [kind, append] : cases) {
+        SCOPED_TRACE(std::string(kDestNames[static_cast<int>(kind)]) + (append ? " appending" : " no read-back"));
         TestHost host;
         DestinationFixture dest(host, kind);
-        const Bytes first = MakePages(1);
-        if (kind == DestKind::Callbacks) dest.stream().data = first;
-        else if (kind == DestKind::FixedBuffer) dest.Preload(first);
-        else WriteFileBytes(dest.file().path(), first);
-        host->appendPages = 1;
+        if (append) {
+            dest.Preload(MakePages(1));
+            host->appendPages = 1;
+        } else {
+            host->sourceReadProc = nullptr;
+        }
         ASSERT_EQ(OpenTIFFForWriting(host.ctx()), 1);
-        FileSpec more;
-        more.pages[0].width = 9;
-        ASSERT_TRUE(WritePages(host->tiff, more, 1));
+        if (!append) { ASSERT_TRUE(WritePages(host->tiff, FileSpec{})); }
+        FileSpec second;
+        second.pages[0].width = 9;
+        EXPECT_EQ(WritePages(host->tiff, second, 1), append);
+        EXPECT_EQ(host.HasError("Destination cannot be read back: a source read function is needed to add a page"),
+                  !append);
         host.EndJob();
         const auto pages = DecodeWithLibtiff(dest.Written());
-        ASSERT_EQ(pages.size(), 2u);
+        ASSERT_EQ(pages.size(), append ? 2u : 1u);
         EXPECT_EQ(pages[0].width, 16u);
-        EXPECT_EQ(pages[1].width, 9u);
+        if (append) { EXPECT_EQ(pages[1].width, 9u); }
     }
-}
-
-TEST(WritingOpen, CallbackDestinationWithoutReadBackFailsAtTheSecondPage) {
-    TestHost host;
-    DestinationFixture dest(host, DestKind::Callbacks);
-    host->sourceReadProc = nullptr;
-    ASSERT_EQ(OpenTIFFForWriting(host.ctx()), 1);
-    EXPECT_TRUE(WritePages(host->tiff, FileSpec{}, 0));
-    EXPECT_FALSE(WritePages(host->tiff, FileSpec{}, 1));
-    EXPECT_TRUE(host.HasError(
-        "Destination cannot be read back: a source read function is needed to add a page"));
-    host.EndJob();
-    EXPECT_GE(DecodeWithLibtiff(dest.Written()).size(), 1u) << "the first page stays readable";
 }
 
 // Each refused destination fails the open with its own host error, the
 // codec's handlers back in force and nothing held: a growing image whose
 // codec object cannot be created releases its block and the work buffer.
 TEST(WritingOpen, DestinationThatCannotBeOpenedIsRefusedWithItsReason) {
-    struct Case {
+    const struct {
         DestKind kind;
         const char* error;
         std::function<void(TestHost&)> spoil;
-    };
-    const Case cases[] = {
+    } cases[] = {
         {DestKind::FileReopened, "Unable to reopen destination file.",
          [](TestHost& host) {
              std::fclose(host->destFp);
@@ -386,7 +344,7 @@ TEST(WritingOpen, DestinationThatCannotBeOpenedIsRefusedWithItsReason) {
              TestAllocator::FailNthCall(2);  // the block is had, the codec's own record is not
          }},
     };
-    for (const Case& c : cases) {
+    for (const auto& c : cases) {
         SCOPED_TRACE(kDestNames[static_cast<int>(c.kind)]);
         HandlerProbe probe;
         TestHost host;
@@ -400,34 +358,17 @@ TEST(WritingOpen, DestinationThatCannotBeOpenedIsRefusedWithItsReason) {
     }
 }
 
-// With no page written the image is the 8-byte header the codec wrote at the
-// open; a second teardown hands nothing over again.
-TEST(GrowingMemory, EmptyImageIsHandedOverOnceAsTheHeaderAlone) {
-    TestHost host;
-    DestinationFixture dest(host, DestKind::GrowingMemory);
-    ASSERT_EQ(OpenTIFFForWriting(host.ctx()), 1);
-    zanDestroyTIFF(host.ctx());
-    EXPECT_EQ(dest.size(), 8u);
-    ASSERT_NE(dest.block(), nullptr);
-    EXPECT_EQ(dest.Written()[0], dest.Written()[1]) << "II or MM";
-    void* const handed = dest.block();
-    dest.Forget();
-    zanDestroyTIFF(host.ctx());
-    EXPECT_EQ(dest.block(), nullptr);
-    TestAllocator::Free(handed);
-}
-
 // A page too big for the buffer, or a buffer too small for the header: the
 // open or the write fails with a report, and nothing lands past the capacity.
 TEST(FixedBuffer, WritingPastTheCapacityFailsWithoutOverflow) {
     FileSpec big;
     big.pages[0].width = big.pages[0].height = 64;
-    for (const auto& [capacity, spec] : {std::pair{200u, big}, std::pair{4u, FileSpec{}}}) {
+    for (const auto& [capacity, file] : {std::pair{200u, big}, std::pair{4u, FileSpec{}}}) {
         SCOPED_TRACE(capacity);
         TestHost host;
         DestinationFixture dest(host, DestKind::FixedBuffer, capacity);
         if (OpenTIFFForWriting(host.ctx()) == 1) {
-            EXPECT_FALSE(WritePages(host->tiff, spec));
+            EXPECT_FALSE(WritePages(host->tiff, file));
         } else {
             EXPECT_TRUE(host.HasError("Unable to create TIFF object"));
         }
@@ -438,41 +379,58 @@ TEST(FixedBuffer, WritingPastTheCapacityFailsWithoutOverflow) {
     }
 }
 
-// ---------------------------------------------------------------- teardown
-
-TEST(Teardown, PageInProgressIsWrittenOut) {
-    TestHost host;
-    DestinationFixture dest(host, DestKind::GrowingMemory);
-    ASSERT_EQ(OpenTIFFForWriting(host.ctx()), 1);
-    TIFF* tif = host->tiff;
-    TIFFSetField(tif, TIFFTAG_IMAGEWIDTH, 8);
-    TIFFSetField(tif, TIFFTAG_IMAGELENGTH, 2);
-    TIFFSetField(tif, TIFFTAG_BITSPERSAMPLE, 8);
-    TIFFSetField(tif, TIFFTAG_PHOTOMETRIC, PHOTOMETRIC_MINISBLACK);
-    uint8_t row[8] = {1, 2, 3, 4, 5, 6, 7, 8};
-    TIFFWriteScanline(tif, row, 0, 0);
-    TIFFWriteScanline(tif, row, 1, 0);
-    host->state = ZAN_STATE_WRITING;
-    host.EndJob();
-    EXPECT_EQ(host->state, static_cast<uint32_t>(ZAN_STATE_WRITING)) << "state is left as it is";
-    const auto pages = DecodeWithLibtiff(dest.Written());
-    ASSERT_EQ(pages.size(), 1u);
-    EXPECT_EQ(pages[0].pixels, Bytes({1, 2, 3, 4, 5, 6, 7, 8, 1, 2, 3, 4, 5, 6, 7, 8}));
+// Teardown writes out a page in progress (the state is left as it is) and
+// hands the growing image over once; with no page written it is the 8-byte
+// header the codec wrote at the open.
+TEST(Teardown, GrowingImageIsHandedOverOnceWithThePageInProgress) {
+    for (bool pageInProgress : {false, true}) {
+        SCOPED_TRACE(pageInProgress);
+        TestHost host;
+        DestinationFixture dest(host, DestKind::GrowingMemory);
+        ASSERT_EQ(OpenTIFFForWriting(host.ctx()), 1);
+        const uint8_t row[8] = {1, 2, 3, 4, 5, 6, 7, 8};
+        if (pageInProgress) {
+            TIFF* tif = host->tiff;
+            TIFFSetField(tif, TIFFTAG_IMAGEWIDTH, 8);
+            TIFFSetField(tif, TIFFTAG_IMAGELENGTH, 2);
+            TIFFSetField(tif, TIFFTAG_BITSPERSAMPLE, 8);
+            TIFFSetField(tif, TIFFTAG_PHOTOMETRIC, PHOTOMETRIC_MINISBLACK);
+            for (uint32_t y = 0; y < 2; ++y) TIFFWriteScanline(tif, const_cast<uint8_t*>(row), y, 0);
+            host->state = ZAN_STATE_WRITING;
+        }
+        zanDestroyTIFF(host.ctx());
+        EXPECT_EQ(host->state, pageInProgress ? static_cast<uint32_t>(ZAN_STATE_WRITING) : 0u);
+        const Bytes written = dest.Written();
+        if (pageInProgress) {
+            const auto pages = DecodeWithLibtiff(written);
+            ASSERT_EQ(pages.size(), 1u);
+            EXPECT_EQ(pages[0].pixels, Bytes({1, 2, 3, 4, 5, 6, 7, 8, 1, 2, 3, 4, 5, 6, 7, 8}));
+        } else {
+            ASSERT_EQ(written.size(), 8u);
+            EXPECT_EQ(written[0], written[1]) << "II or MM";
+        }
+        void* const handed = dest.block();
+        dest.Forget();
+        zanDestroyTIFF(host.ctx());
+        EXPECT_EQ(dest.block(), nullptr) << "nothing is handed over again";
+        TestAllocator::Free(handed);
+    }
 }
 
 // A page left half read: its strip buffer, work line and palette copy go.
-TEST(Teardown, ReaderBuffersAreReleased) {
-    FileSpec tiled;
+// A memory source is never taken for the memory image, even with a memory
+// destination set for a pass-through delivery.
+TEST(Teardown, ReaderBuffersAreReleasedAndTheMemorySourceIsLeftAlone) {
+    FileSpec tiled, palette;
     tiled.pages[0].tileWidth = tiled.pages[0].tileHeight = 16;
-    FileSpec palette;
     palette.pages[0].photometric = PHOTOMETRIC_PALETTE;
     for (int i = 0; i < 768; ++i) palette.pages[0].colorMap.push_back(static_cast<uint16_t>(i * 85));
-    for (const FileSpec& spec : {tiled, palette}) {
-        const Bytes tiff = MakeTiff(spec);
+    for (const FileSpec& file : {tiled, palette}) {
         TestHost host;
-        host->sourceKind = ZAN_SOURCE_MEMORY;
-        host->sourceMemory = tiff.data();
-        host->sourceMemorySize = static_cast<uint32_t>(tiff.size());
+        SourceFixture source(host, SourceKind::Memory, MakeTiff(file));
+        void* out = nullptr;
+        host->destKind = ZAN_DEST_MEMORY;
+        host->destMemory = &out;
         Bytes line(256);
         TestAllocator::Reset();
         ASSERT_NE(zanTIFFReadNextScanLine(host.ctx(), line.data(), static_cast<uint32_t>(line.size())), 0u);
@@ -482,25 +440,10 @@ TEST(Teardown, ReaderBuffersAreReleased) {
         EXPECT_EQ(host->paletteRed, nullptr);
         EXPECT_EQ(host->frameData, nullptr) << "the palette's work line";
         EXPECT_EQ(TestAllocator::LiveBlocks(), 0u);
+        EXPECT_EQ(out, nullptr);
+        EXPECT_EQ(source.bytes(), MakeTiff(file)) << "the host's data are untouched";
     }
 }
-
-TEST(Teardown, MemorySourceIsNeverTakenForTheMemoryImage) {
-    Bytes tiff = MakePages(1);
-    TestHost host;
-    host->sourceKind = ZAN_SOURCE_MEMORY;
-    host->sourceMemory = tiff.data();
-    host->sourceMemorySize = static_cast<uint32_t>(tiff.size());
-    void* out = nullptr;
-    host->destKind = ZAN_DEST_MEMORY;  // set for a pass-through delivery
-    host->destMemory = &out;
-    ASSERT_EQ(OpenTIFFForReading(host.ctx()), 1);
-    host.EndJob();
-    EXPECT_EQ(out, nullptr);
-    EXPECT_EQ(tiff, MakePages(1)) << "the host's data are untouched";
-}
-
-// ------------------------------------------- every kind, whatever fails
 
 // Runs `job` with the nth allocation failing, for n = 1, 2, … until a run
 // makes no more than n-1 allocations, which must succeed. Every run must end
@@ -555,11 +498,10 @@ TEST(ReadingOpen, EverySourceKindReadsEveryPageWhateverAllocationFails) {
     }
 }
 
-// Every kind of destination ends up holding the same multi-page file (a file
-// handed in read-only is reopened from its path). The host's size and image
-// variables are cleared at the open; a growing image starts at half the frame
-// buffer plus 60 bytes and is handed over from the job's allocator, the only
-// block left.
+// Every kind of destination ends up holding the same multi-page file. The
+// host's size and image variables are cleared at the open; a growing image
+// starts at half the frame buffer plus 60 bytes and is handed over from the
+// job's allocator, the only block left.
 TEST(WritingOpen, EveryDestinationHoldsTheSameFileWhateverAllocationFails) {
     const auto pages = DecodeWithLibtiff(MakeTiff(ThreePages()));
     Bytes reference;

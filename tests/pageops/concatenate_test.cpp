@@ -11,6 +11,8 @@ namespace {
 
 using namespace zantest;
 
+// Big-endian pages join a little-endian file in its order, with their
+// pixels and their values (text, resolution) converted.
 TEST(Concatenate, AppendsBigEndianPagesToALittleEndianFileInItsOrder) {
     BuiltPage described = GreyPage(6, 4, 1, 2);
     described.entries.push_back(AsciiEntry(270, "second page"));
@@ -29,9 +31,11 @@ TEST(Concatenate, AppendsBigEndianPagesToALittleEndianFileInItsOrder) {
     EXPECT_NE(second.tags.find("Resolution: 300"), std::string::npos);
 }
 
+// The ExifIFD pointer, which libtiff writes as type IFD, leads to an EXIF
+// directory relocated and converted like the page's own. With Compression
+// and BitsPerSample as LONG, 16-bit samples of an uncompressed page are
+// swapped, and a compressed page with them is refused.
 TEST(Concatenate, PointersOfTypeIfdAndFieldsStoredAsLongChangeByteOrder) {
-    // libtiff writes the ExifIFD pointer as type IFD: the EXIF directory is
-    // relocated and converted like the page's own.
     const Bytes exif = MakeExifTiff();
     FileJob withExif(exif, BuildTiff({GreyPage(3, 3, 3)}, {.bigEndian = true}));
     ASSERT_EQ(withExif.Concatenate(), 1) << ::testing::PrintToString(withExif.Errors());
@@ -40,8 +44,6 @@ TEST(Concatenate, PointersOfTypeIfdAndFieldsStoredAsLongChangeByteOrder) {
     EXPECT_EQ(WithoutLines(copied.exifTags, {"Directory at"}), WithoutLines(original.exifTags, {"Directory at"}));
     EXPECT_EQ(copied.data, original.data);
 
-    // Compression and BitsPerSample as LONG: 16-bit samples of an
-    // uncompressed page are swapped, a compressed page with them refused.
     auto sixteenBit = [](uint32_t compression) {
         BuiltPage page;
         page.entries = {LongEntry(256, {3}), LongEntry(257, {2}), LongEntry(258, {16}), LongEntry(259, {compression}),
@@ -54,8 +56,83 @@ TEST(Concatenate, PointersOfTypeIfdAndFieldsStoredAsLongChangeByteOrder) {
     EXPECT_EQ(DecodeWithLibtiff(swapped.Dest())[1].pixels, DecodeWithLibtiff(sixteenBit(COMPRESSION_NONE))[0].pixels);
     FileJob refused(sixteenBit(COMPRESSION_LZW), BuildTiff({GreyPage(3, 3, 3)}));
     EXPECT_EQ(refused.Concatenate(), 0);
-    EXPECT_EQ(refused.Errors(),
-              std::vector<std::string>{"Page samples of more than 8 bits cannot change byte order without decoding."});
+    EXPECT_EQ(refused.Errors(), Texts{"Page samples of more than 8 bits cannot change byte order without decoding."});
+}
+
+// The first appended directory lies right behind the destination's data, at
+// an even offset: behind a copy of the file itself, behind an odd-sized
+// file (one skipped byte), at 8 in a file without pages. A source without
+// pages leaves only the 12-byte write test at the end.
+TEST(Concatenate, AppendsBehindWhateverTheDestinationHolds) {
+    const Bytes two = BuildTiff({GreyPage(4, 4, 2), GreyPage(3, 3, 3)}), none = BuildTiff({});
+    Bytes odd = BuildTiff({GreyPage(3, 3, 3)});
+    if (odd.size() % 2 == 0) odd.push_back(0);
+    const struct {
+        Bytes source, dest;
+        size_t pages;
+    } cases[] = {{two, two, 4}, {two, odd, 3}, {two, none, 2}, {none, odd, 1}};
+    for (const auto& c : cases) {
+        SCOPED_TRACE(testing::Message() << c.source.size() << " bytes onto " << c.dest.size());
+        FileJob job(c.source, c.dest);
+        ASSERT_EQ(job.Concatenate(), 1) << ::testing::PrintToString(job.Errors());
+        const Bytes out = job.Dest();
+        EXPECT_EQ(DecodeWithLibtiff(out).size(), c.pages);
+        const size_t before = DirectoryOffsets(c.dest).size();
+        if (c.source == none) {
+            EXPECT_EQ(out.size(), c.dest.size() + 12) << "the write test stays at the end";
+        } else {
+            ASSERT_GT(DirectoryOffsets(out).size(), before);
+            EXPECT_EQ(DirectoryOffsets(out)[before], c.dest.size() + c.dest.size() % 2);
+        }
+    }
+}
+
+// Each refusal has its own message, and the destination keeps its pages:
+// untouched when a file is refused before the write test, plus the page
+// appended before one with a field the conversion cannot take.
+TEST(Concatenate, RefusalsHaveTheirOwnMessagesAndTheDestinationKeepsItsPages) {
+    const Bytes good = BuildTiff({GreyPage(3, 3, 3)});
+    Bytes notTiff = good, badId = good, looping = BuildTiff({GreyPage(3, 3, 3), GreyPage(3, 3, 3)});
+    notTiff[1] = 'M';
+    badId[2] = 0;
+    const auto dirs = DirectoryOffsets(looping);
+    Put32(looping, dirs[1] + 2 + 12u * Get16(looping, dirs[1]), dirs[0]);
+    auto secondPageWith = [](const RawEntry& entry) {  // in the byte order of `good`
+        BuiltPage bad = GreyPage(4, 4, 4);
+        bad.entries.push_back(entry);
+        return BuildTiff({GreyPage(2, 2, 2), bad});
+    };
+    enum After { Untouched, SamePages, OneMorePage };
+    const struct {
+        Bytes source, dest;
+        const char* message;
+        After after;
+        void (*setUp)(FileJob&) = nullptr;
+    } cases[] = {
+        {notTiff, good, "Source is not TIFF.", Untouched},
+        {good, notTiff, "Destination is not TIFF.", Untouched},
+        {badId, good, "Error in second 2 bytes (TIFF id).\n", Untouched},
+        {good, badId, "Error in second 2 bytes (TIFF id).\n", Untouched},
+        {looping, good, "Source directory chain loops.", SamePages},
+        {good, looping, "Destination directory chain loops.", SamePages},
+        {good, good, "Source and destination must be files.", Untouched,
+         [](FileJob& job) { job.host()->sourceKind = ZAN_SOURCE_MEMORY; }},
+        {good, good, "Unable to write to destination file.", Untouched,
+         [](FileJob& job) { ASSERT_NE(std::freopen(nullptr, "rb", job.host()->destFp), nullptr); }},
+        {secondPageWith(TypedEntry(40000, 13, 1, Bytes{8, 0, 0, 0})), good, "Unhandled TIFF TYPE.", OneMorePage},
+        {secondPageWith(DoubleEntry(33550, 1.5)), good, "Unhandled type.", OneMorePage},
+        {secondPageWith(TypedEntry(40001, 99, 1, Bytes{1})), good, "Unhandled TIFF TYPE.", OneMorePage},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.message);
+        FileJob job(c.source, c.dest);
+        if (c.setUp) c.setUp(job);
+        EXPECT_EQ(job.Concatenate(), 0);
+        EXPECT_EQ(job.Errors(), Texts{c.message});
+        const Bytes out = job.Dest();
+        if (c.after == Untouched) { EXPECT_EQ(out, c.dest); }
+        EXPECT_EQ(DecodeWithLibtiff(out).size(), DecodeWithLibtiff(c.dest).size() + (c.after == OneMorePage));
+    }
 }
 
 #if defined(__GLIBC__)
@@ -63,7 +140,7 @@ TEST(Concatenate, PointersOfTypeIfdAndFieldsStoredAsLongChangeByteOrder) {
 struct RecordingFile {
     FILE* file;
     int64_t position = 0;
-    std::vector<std::pair<int64_t, size_t>> writes;
+    std::vector<std::pair<int64_t, size_t>> writes = {};
     static ssize_t Write(void* cookie, const char* data, size_t n) {
         auto* r = static_cast<RecordingFile*>(cookie);
         r->writes.emplace_back(r->position, n);
@@ -89,9 +166,9 @@ struct RecordingFile {
     }
 };
 
+// The destination never points at a page that is not all there: the link
+// to each appended page is the last thing written for it.
 TEST(Concatenate, PagesAreLinkedOnlyOnceWrittenWhole) {
-    // The destination never points at a page that is not all there: the
-    // link to each appended page is the last thing written for it.
     const Bytes dest = BuildTiff({GreyPage(3, 3, 3)});
     FileJob job(BuildTiff({GreyPage(40, 30, 5)}), dest);
     RecordingFile recording{job.host()->destFp};
@@ -110,95 +187,5 @@ TEST(Concatenate, PagesAreLinkedOnlyOnceWrittenWhole) {
         EXPECT_NE(recording.writes[i].first, link) << "write " << i << " of " << recording.writes.size();
 }
 #endif
-
-TEST(Concatenate, FileAppendedToACopyOfItselfDoublesItsPages) {
-    const Bytes file = BuildTiff({GreyPage(4, 4, 2), GreyPage(3, 3, 3)});
-    FileJob job(file, file);
-    ASSERT_EQ(job.Concatenate(), 1);
-    EXPECT_EQ(DecodeWithLibtiff(job.Dest()).size(), 4u);
-}
-
-TEST(Concatenate, OddSizedDestinationGetsOneSkippedByte) {
-    Bytes dest = BuildTiff({GreyPage(3, 3, 3)});
-    if (dest.size() % 2 == 0) dest.push_back(0);
-    FileJob job(BuildTiff({GreyPage(4, 4, 4)}), dest);
-    ASSERT_EQ(job.Concatenate(), 1);
-    const auto dirs = DirectoryOffsets(job.Dest());
-    ASSERT_EQ(dirs.size(), 2u);
-    EXPECT_EQ(dirs[1], dest.size() + 1);
-}
-
-TEST(Concatenate, FilesWithoutDirectories) {
-    const Bytes page = BuildTiff({GreyPage(3, 3, 3)});
-    FileJob emptySource(BuildTiff({}), page);
-    EXPECT_EQ(emptySource.Concatenate(), 1);
-    EXPECT_EQ(emptySource.Dest().size(), page.size() + 12) << "the write test stays at the end";
-    EXPECT_EQ(DecodeWithLibtiff(emptySource.Dest()).size(), 1u);
-    FileJob emptyDest(page, BuildTiff({}));
-    ASSERT_EQ(emptyDest.Concatenate(), 1);
-    EXPECT_EQ(DecodeWithLibtiff(emptyDest.Dest()).size(), 1u) << "the destination gets its first page";
-}
-
-TEST(Concatenate, FieldsItCannotConvertFailTheCallAndLeaveTheDestinationReadable) {
-    struct Case {
-        RawEntry entry;
-        const char* message;
-    };
-    const Case cases[] = {
-        {TypedEntry(40000, 13, 1, Bytes{8, 0, 0, 0}), "Unhandled TIFF TYPE."},
-        {DoubleEntry(33550, 1.5), "Unhandled type."},
-        {TypedEntry(40001, 99, 1, Bytes{1}), "Unhandled TIFF TYPE."},
-    };
-    for (const Case& c : cases) {
-        BuiltPage bad = GreyPage(4, 4, 4);
-        bad.entries.push_back(c.entry);
-        FileJob job(BuildTiff({GreyPage(2, 2, 2), bad}), BuildTiff({GreyPage(3, 3, 3)}));  // same byte order
-        EXPECT_EQ(job.Concatenate(), 0);
-        EXPECT_EQ(job.Errors(), std::vector<std::string>{c.message});
-        EXPECT_EQ(DecodeWithLibtiff(job.Dest()).size(), 2u) << "the former page and the one appended before";
-    }
-}
-
-TEST(Concatenate, RefusedFilesHaveTheirOwnMessagesAndTheDestinationKeepsItsPages) {
-    const Bytes good = BuildTiff({GreyPage(3, 3, 3)});
-    Bytes notTiff = good, badId = good, looping = BuildTiff({GreyPage(3, 3, 3), GreyPage(3, 3, 3)});
-    notTiff[1] = 'M';
-    badId[2] = 0;
-    const auto dirs = DirectoryOffsets(looping);
-    Put32(looping, dirs[1] + 2 + 12u * Get16(looping, dirs[1]), dirs[0]);
-    struct Case {
-        Bytes source, dest;
-        const char* message;
-        bool memorySource = false;
-    } cases[] = {
-        {notTiff, good, "Source is not TIFF."},
-        {good, notTiff, "Destination is not TIFF."},
-        {badId, good, "Error in second 2 bytes (TIFF id).\n"},
-        {good, badId, "Error in second 2 bytes (TIFF id).\n"},
-        {looping, good, "Source directory chain loops."},
-        {good, looping, "Destination directory chain loops."},
-        {good, good, "Source and destination must be files.", true},
-    };
-    for (const Case& c : cases) {
-        FileJob job(c.source, c.dest);
-        if (c.memorySource) job.host()->sourceKind = ZAN_SOURCE_MEMORY;
-        EXPECT_EQ(job.Concatenate(), 0);
-        EXPECT_EQ(job.Errors(), std::vector<std::string>{c.message});
-        EXPECT_EQ(DecodeWithLibtiff(job.Dest()).size(), DecodeWithLibtiff(c.dest).size()) << c.message;
-    }
-}
-
-TEST(Concatenate, ReadOnlyDestinationFailsTheWriteTest) {
-    const Bytes dest = BuildTiff({GreyPage(3, 3, 3)});
-    TempFile file;
-    WriteFileBytes(file.path(), dest);
-    FileJob job(BuildTiff({GreyPage(3, 3, 3)}), {});
-    FILE* readOnly = std::fopen(file.c_str(), "rb");
-    job.host()->destFp = readOnly;
-    EXPECT_EQ(job.Concatenate(), 0);
-    EXPECT_EQ(job.Errors(), std::vector<std::string>{"Unable to write to destination file."});
-    std::fclose(readOnly);
-    EXPECT_EQ(ReadFileBytes(file.path()), dest);
-}
 
 }  // namespace

@@ -19,57 +19,37 @@ Bytes ExtractFirst(const Bytes& source) {
     return job.Extract(1) ? job.Dest() : Bytes();
 }
 
-// A grey page of one-row strips whose offsets and byte counts are SHORTs.
-BuiltPage ShortStrips(uint32_t width, uint32_t height) {
-    BuiltPage page = GreyPage(width, height, 1);
-    page.offsetsType = page.countsType = 3;
-    return page;
-}
-
 uint16_t OffsetsType(const Bytes& out) {
     FoundEntry e;
     return FindEntry(out, 8, 273, &e) ? e.type : 0;
 }
 
-TEST(PageCopy, ShortOffsetsStayShortWhileTheyFitAndWidenWhenTheyMightNot) {
-    // One page of S strips; D + 4 (S + 128) + T against 65535.
-    for (uint32_t height : {8u, 120u}) {
-        const Bytes source = BuildTiff({ShortStrips(500, height)});
-        if (source.size() > 65535) continue;
-        const Bytes out = ExtractFirst(source);
-        ASSERT_FALSE(out.empty());
-        const uint64_t total = 500u * height;
-        EXPECT_EQ(OffsetsType(out), total + 4 * (height + 128) + 200 > 65535 ? 4 : 3) << height;
-        EXPECT_EQ(DecodeWithLibtiff(out)[0].pixels, DecodeWithLibtiff(source)[0].pixels);
-    }
-}
-
-TEST(PageCopy, WideningHappensAtTheExactThreshold) {
-    // Two strips, both arrays inline as SHORTs: D is the end of the directory
-    // and T twice the width.
-    auto twoStrips = [](uint32_t width) { return BuildTiff({ShortStrips(width, 2)}); };
-    uint32_t lo = 1000, hi = 40000;
-    ASSERT_EQ(OffsetsType(ExtractFirst(twoStrips(lo))), 3);
-    ASSERT_EQ(OffsetsType(ExtractFirst(twoStrips(hi))), 4);
-    while (hi - lo > 1) {
-        const uint32_t mid = (lo + hi) / 2;
-        (OffsetsType(ExtractFirst(twoStrips(mid))) == 3 ? lo : hi) = mid;
-    }
-    const Bytes out = ExtractFirst(twoStrips(lo));
-    const uint64_t d = 8 + 2 + 12u * Get16(out, 8) + 4;
-    EXPECT_LE(d + 4 * (2 + 128) + 2u * lo, 65535u);
-    EXPECT_GT(d + 4 * (2 + 128) + 2u * hi, 65535u);
-    const Bytes wide = ExtractFirst(twoStrips(hi));
-    EXPECT_EQ(DecodeWithLibtiff(wide)[0].pixels, DecodeWithLibtiff(twoStrips(hi))[0].pixels);
-}
-
-TEST(PageCopy, InlineOffsetsGetTheNewOffsetsInline) {
-    for (const BuiltPage& page : {GreyPage(4, 2, 2), ShortStrips(4, 2)}) {
-        const Bytes source = BuildTiff({page}, {.leadingPadding = 40});
-        const Bytes out = ExtractFirst(source);
-        ASSERT_FALSE(out.empty());
-        EXPECT_EQ(DecodeWithLibtiff(out)[0].pixels, DecodeWithLibtiff(source)[0].pixels);
-        EXPECT_LT(out.size(), source.size()) << "the padding is not copied";
+// SHORT strip offsets stay SHORT while D + 4 (S + 128) + T fits in 16 bits
+// (D where the offsets go, S strips of T bytes in all) and become LONG from
+// the first width where they might not, inline or as an array; the pixels
+// are copied either way.
+TEST(PageCopy, ShortOffsetsWidenExactlyWhenTheyMightNotFit) {
+    for (uint32_t strips : {2u, 8u}) {
+        SCOPED_TRACE(strips);
+        auto source = [strips](uint32_t width) {
+            BuiltPage page = GreyPage(width, strips, 1);
+            page.offsetsType = page.countsType = 3;
+            return BuildTiff({page});
+        };
+        uint32_t lo = 100, hi = 72000 / strips;
+        ASSERT_EQ(OffsetsType(ExtractFirst(source(lo))), 3);
+        ASSERT_EQ(OffsetsType(ExtractFirst(source(hi))), 4);
+        while (hi - lo > 1) {
+            const uint32_t mid = (lo + hi) / 2;
+            (OffsetsType(ExtractFirst(source(mid))) == 3 ? lo : hi) = mid;
+        }
+        // D: the end of the directory, and of the byte counts when they do not fit in their entry.
+        const Bytes narrow = ExtractFirst(source(lo));
+        const uint64_t d = 8 + 2 + 12u * Get16(narrow, 8) + 4 + (strips > 2 ? 2 * strips : 0);
+        EXPECT_LE(d + 4 * (strips + 128) + uint64_t{strips} * lo, 65535u);
+        EXPECT_GT(d + 4 * (strips + 128) + uint64_t{strips} * hi, 65535u);
+        EXPECT_EQ(DecodeWithLibtiff(narrow)[0].pixels, DecodeWithLibtiff(source(lo))[0].pixels);
+        EXPECT_EQ(DecodeWithLibtiff(ExtractFirst(source(hi)))[0].pixels, DecodeWithLibtiff(source(hi))[0].pixels);
     }
 }
 
@@ -81,15 +61,6 @@ Bytes WithStripTags(std::vector<RawEntry> entries, bool keepOwn = false) {
     return BuildTiff({page});
 }
 
-// Little-endian numbers for building structures by hand.
-void Put16Le(Bytes& b, size_t at, uint16_t v) {
-    b[at] = static_cast<uint8_t>(v);
-    b[at + 1] = static_cast<uint8_t>(v >> 8);
-}
-void Put32Le(Bytes& b, size_t at, uint32_t v) {
-    for (int i = 0; i < 4; ++i) b[at + i] = static_cast<uint8_t>(v >> (8 * i));
-}
-
 // A page with `n` ExifIFD entries, each pointing at its own empty directory
 // (zero bytes of the leading padding read as such).
 Bytes ManyExifDirectories(uint32_t n) {
@@ -98,6 +69,9 @@ Bytes ManyExifDirectories(uint32_t n) {
     return BuildTiff({page}, {.leadingPadding = 6 * n + 8});
 }
 
+// A page the copy cannot take whole, or whose offsets it could not
+// relocate (they would point into the wrong place), is refused with its
+// reason before any of it is written.
 TEST(PageCopy, RefusesPagesItCannotRelocateAndWritesNoPage) {
     Bytes farValue = BuildTiff({GreyPage(4, 2, 2)});
     FoundEntry e;
@@ -106,7 +80,8 @@ TEST(PageCopy, RefusesPagesItCannotRelocateAndWritesNoPage) {
     Put32(farValue, e.valueField, 0x7FFFFFF0);
     Bytes brokenChain = BuildTiff({GreyPage(4, 2, 2)});
     Put32(brokenChain, 4, static_cast<uint32_t>(brokenChain.size() - 3));
-    const struct Case {
+    const char* const kTables = "Old-style JPEG tables outside the JPEG interchange data cannot be copied.";
+    const struct {
         Bytes source;
         const char* message;
         size_t written = 8;  // the header of the one-page file, or nothing when the walk fails first
@@ -122,55 +97,53 @@ TEST(PageCopy, RefusesPagesItCannotRelocateAndWritesNoPage) {
          "Source strip data lie beyond the end of the file."},
         {farValue, "Source value lies beyond the end of the file."},
         {brokenChain, "Source directory chain is damaged.", 0},
-        // Offsets the copy cannot relocate would point into the wrong place.
         {WithStripTags({LongEntry(330, {8})}, true), "Pages with SubIFDs cannot be copied."},
-        {WithStripTags({LongEntry(519, {8})}, true),
-         "Old-style JPEG tables outside the JPEG interchange data cannot be copied."},
-        {WithStripTags({LongEntry(513, {8}), LongEntry(514, {4}), LongEntry(520, {40})}, true),
-         "Old-style JPEG tables outside the JPEG interchange data cannot be copied."},
+        {WithStripTags({LongEntry(519, {8})}, true), kTables},
+        {WithStripTags({LongEntry(513, {8}), LongEntry(514, {4}), LongEntry(520, {40})}, true), kTables},
         {ManyExifDirectories(65), "Source page has too many EXIF, GPS or Interoperability directories."},
     };
-    for (const Case& c : cases) {
+    for (const auto& c : cases) {
         FileJob job(c.source, {});
         EXPECT_EQ(job.Extract(1), 0);
-        EXPECT_EQ(job.Errors(), std::vector<std::string>{c.message});
+        EXPECT_EQ(job.Errors(), Texts{c.message});
         EXPECT_EQ(job.Dest().size(), c.written) << c.message;
     }
 }
 
+// 30 ExifIFD entries point at one EXIF directory, whose 30 Interop entries
+// point at one Interoperability directory holding 2 KiB: each is copied
+// once, so the page stays the size it is (not 900 copies of the 2 KiB).
 TEST(PageCopy, SubDirectoriesPointedAtManyTimesAreCopiedOnce) {
-    // 30 ExifIFD entries point at one EXIF directory, whose 30 Interop
-    // entries point at one Interoperability directory holding 2 KiB: copied
-    // once each, the page stays the size it is (900 copies of the 2 KiB
-    // before).
-    Bytes padding(2 + 12 + 4 + 2 + (2 + 12 * 30 + 4) + 2048, 0);
     const uint32_t interop = 8, exif = 28, value = exif + 2 + 12 * 30 + 4;
-    Put16Le(padding, interop - 8, 1);
-    Put16Le(padding, interop - 8 + 2, 1);  // InteroperabilityIndex
-    Put16Le(padding, interop - 8 + 4, 7);  // UNDEFINED
-    Put32Le(padding, interop - 8 + 6, 2048);
-    Put32Le(padding, interop - 8 + 10, value);
-    Put16Le(padding, exif - 8, 30);
-    for (uint32_t i = 0; i < 30; ++i) {
-        const size_t at = exif - 8 + 2 + 12 * i;
-        Put16Le(padding, at, 40965);
-        Put16Le(padding, at + 2, 4);
-        Put32Le(padding, at + 4, 1);
-        Put32Le(padding, at + 8, interop);
-    }
     BuiltPage page = GreyPage(4, 2, 2);
     for (int i = 0; i < 30; ++i) page.entries.push_back(LongEntry(34665, {exif}));
-    Bytes source = BuildTiff({page}, {.leadingPadding = static_cast<uint32_t>(padding.size())});
-    std::copy(padding.begin(), padding.end(), source.begin() + 8);
+    Bytes source = BuildTiff({page}, {.leadingPadding = value + 2048 - 8});
+    auto put16 = [&source](size_t at, uint16_t v) {
+        source[at] = static_cast<uint8_t>(v);
+        source[at + 1] = static_cast<uint8_t>(v >> 8);
+    };
+    put16(interop, 1);
+    put16(interop + 2, 1);  // InteroperabilityIndex
+    put16(interop + 4, 7);  // UNDEFINED
+    Put32(source, interop + 6, 2048);
+    Put32(source, interop + 10, value);
+    put16(exif, 30);
+    for (uint32_t i = 0; i < 30; ++i) {
+        const size_t at = exif + 2 + 12 * i;
+        put16(at, 40965);
+        put16(at + 2, 4);
+        Put32(source, at + 4, 1);
+        Put32(source, at + 8, interop);
+    }
     const Bytes out = ExtractFirst(source);
     ASSERT_FALSE(out.empty());
     EXPECT_LT(out.size(), source.size());
     EXPECT_EQ(DecodeWithLibtiff(out)[0].pixels, DecodeWithLibtiff(source)[0].pixels);
 }
 
+// JPEGInterchangeFormat's block is copied whole, and the table offsets that
+// point into it move with it.
 TEST(PageCopy, OldStyleJpegDataMovesWithItsTables) {
-    // JPEGInterchangeFormat's block is copied whole, and the table offsets
-    // that point into it move with it.
     Bytes block(64);
     for (size_t i = 0; i < block.size(); ++i) block[i] = static_cast<uint8_t>(200 - i);
     BuiltPage page = GreyPage(4, 2, 2);
@@ -215,6 +188,8 @@ Bytes StripsInReverse(uint32_t width, uint32_t height, uint32_t rowsPerStrip) {
     return ReadFileBytes(file.path());
 }
 
+// Strips in any order and of any size are copied in index order, each at
+// an even offset.
 TEST(PageCopy, StripsInAnyOrderAndOfAnySizeLandAtEvenOffsets) {
     for (const Bytes& source : {StripsInReverse(33, 40, 1), StripsInReverse(33, 40, 3),
                                 StripsInReverse(1501, 1400, 1047)}) {

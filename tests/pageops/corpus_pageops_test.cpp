@@ -29,18 +29,14 @@ uint32_t CountPages(const Bytes& tiff) {
 // BigTIFF, pages whose strip byte counts are missing, pages with SubIFDs,
 // and in concatenation IFD-typed fields it cannot relocate, DOUBLE values
 // and wide samples that would change byte order.
-bool AcceptableRefusal(const std::vector<std::string>& errors, bool concatenating) {
-    static const std::vector<std::string> kAlways = {
-        "Error in second 2 bytes (TIFF id).\n", "Source page has strip offsets but no byte counts.",
-        "Pages with SubIFDs cannot be copied."};
-    static const std::vector<std::string> kConcatenation = {
-        "Unhandled TIFF TYPE.", "Unhandled type.",
-        "Page samples of more than 8 bits cannot change byte order without decoding."};
-    if (errors.size() != 1) return false;
-    auto in = [&](const std::vector<std::string>& list) {
-        return std::find(list.begin(), list.end(), errors[0]) != list.end();
-    };
-    return in(kAlways) || (concatenating && in(kConcatenation));
+bool AcceptableRefusal(const Texts& errors, bool concatenating) {
+    static const Texts kAlways = {"Error in second 2 bytes (TIFF id).\n",
+                                  "Source page has strip offsets but no byte counts.",
+                                  "Pages with SubIFDs cannot be copied."};
+    static const Texts kConcatenation = {"Unhandled TIFF TYPE.", "Unhandled type.",
+                                         "Page samples of more than 8 bits cannot change byte order without decoding."};
+    const auto in = [&](const Texts& list) { return std::find(list.begin(), list.end(), errors[0]) != list.end(); };
+    return errors.size() == 1 && (in(kAlways) || (concatenating && in(kConcatenation)));
 }
 
 // `orderChanged`: the page was copied into a file of the other byte order.
@@ -67,6 +63,8 @@ protected:
     std::vector<CorpusFile> files_;
 };
 
+// Every page of a good multi-page or EXIF file extracts with its tags and
+// pixels, or is refused for a reason the walker states.
 TEST_F(CorpusPageOps, EveryPageOfGoodFilesExtractsWithItsTagsAndPixels) {
     int extracted = 0;
     for (const CorpusFile& file : files_) {
@@ -89,6 +87,8 @@ TEST_F(CorpusPageOps, EveryPageOfGoodFilesExtractsWithItsTagsAndPixels) {
     EXPECT_GT(extracted, 50);
 }
 
+// Every good file appends to a file of either byte order with its tags and
+// pixels, or is refused for a stated reason leaving the destination's page.
 TEST_F(CorpusPageOps, GoodFilesAppendToFilesOfEitherByteOrder) {
     int appended = 0;
     for (const CorpusFile& file : files_) {
@@ -97,12 +97,9 @@ TEST_F(CorpusPageOps, GoodFilesAppendToFilesOfEitherByteOrder) {
         const uint32_t pages = CountPages(source);
         if (pages == 0) continue;
         for (bool bigEndian : {false, true}) {
-            BuildOptions order;
-            order.bigEndian = bigEndian;
-            FileJob job(source, BuildTiff({GreyPage(5, 3, 3)}, order));
+            FileJob job(source, BuildTiff({GreyPage(5, 3, 3)}, {.bigEndian = bigEndian}));
             const std::string what = file.relpath + (bigEndian ? " onto MM" : " onto II");
-            const int result = job.Concatenate();
-            if (!result) {
+            if (!job.Concatenate()) {
                 EXPECT_TRUE(AcceptableRefusal(job.Errors(), true))
                     << what << ": " << ::testing::PrintToString(job.Errors());
                 EXPECT_GE(CountPages(job.Dest()), 1u) << what << ": the destination keeps its page";
@@ -119,6 +116,8 @@ TEST_F(CorpusPageOps, GoodFilesAppendToFilesOfEitherByteOrder) {
     EXPECT_GT(appended, 200);
 }
 
+// A hostile file ends every call with a result, and a failure with a
+// message and a readable destination.
 TEST_F(CorpusPageOps, HostileFilesEndWithAResultAndAMessage) {
     const Bytes valid = BuildTiff({GreyPage(5, 3, 3)});
     for (const CorpusFile& file : files_) {

@@ -3,12 +3,15 @@
 
 #include <cstdio>
 #include <string>
+#include <vector>
 
 #include "support/test_host.h"
 #include "support/tiff_fixtures.h"
 #include "zantiff/zantiff.h"
 
 namespace zantest {
+
+using Texts = std::vector<std::string>;
 
 class FileJob {
 public:

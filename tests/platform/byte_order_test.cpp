@@ -1,3 +1,6 @@
+// The reference host's FillOrder bit reversal. (Its byte-order accessors are
+// checked through the pages the page operations convert between orders.)
+
 #include <gtest/gtest.h>
 
 #include <cstring>
@@ -6,25 +9,7 @@
 
 namespace {
 
-TEST(ByteOrder, ReadsAndStoresBothOrders) {
-    const unsigned char bytes[4] = {0x12, 0x34, 0x56, 0x78};
-    EXPECT_EQ(zanGetUINT16Big(nullptr, bytes), 0x1234);
-    EXPECT_EQ(zanGetUINT16Little(nullptr, bytes), 0x3412);
-    EXPECT_EQ(zanGetUINT32Big(nullptr, bytes), 0x12345678u);
-    EXPECT_EQ(zanGetUINT32Little(nullptr, bytes), 0x78563412u);
-    unsigned char out[4] = {};
-    zanMake2ByteIntBig(nullptr, 0xA1B2, out);
-    EXPECT_EQ(zanGetUINT16Big(nullptr, out), 0xA1B2);
-    zanMake2ByteIntLittle(nullptr, 0xA1B2, out);
-    EXPECT_EQ(out[0], 0xB2);
-    zanMake4ByteIntBig(nullptr, 0xCAFEF00Du, out);
-    EXPECT_EQ(zanGetUINT32Big(nullptr, out), 0xCAFEF00Du);
-    EXPECT_EQ(out[0], 0xCA);
-    zanMake4ByteIntLittle(nullptr, 0xCAFEF00Du, out);
-    EXPECT_EQ(zanGetUINT32Little(nullptr, out), 0xCAFEF00Du);
-    EXPECT_EQ(out[0], 0x0D);
-}
-
+// Every byte of the count has its bits reversed; bytes past it stay.
 TEST(ByteReverse, ReversesTheBitsOfEveryByte) {
     unsigned char data[] = {0x01, 0x80, 0xF0, 0xA5, 0x00, 0xFF, 0x12};
     zanByteReverseBuffer(nullptr, data, sizeof data - 1);

@@ -36,10 +36,11 @@ struct Client {
     }
     static uint32_t Size(void* c) { return static_cast<uint32_t>(Of(c).stream.data.size()); }
 
-    TIFF* Open(const char* mode, PivloAllocProc alloc = TestAllocator::Alloc,
-               PivloFreeProc release = TestAllocator::Free) {
-        return TIFFClientOpenPivlo("client", mode, this, Read, Write, Seek, Close, Size, nullptr,
-                                   nullptr, alloc, TestAllocator::Realloc, release);
+    TIFF* Open(const char* mode, bool hostAllocators = true) {
+        stream.position = 0;
+        return TIFFClientOpenPivlo("client", mode, this, Read, Write, Seek, Close, Size, nullptr, nullptr,
+                                   hostAllocators ? TestAllocator::Alloc : nullptr, TestAllocator::Realloc,
+                                   hostAllocators ? TestAllocator::Free : nullptr);
     }
 };
 
@@ -58,7 +59,7 @@ protected:
 };
 
 // A page written, one appended, both read back; the close procedure runs
-// once for each object, at TIFFClose.
+// once for each object, at TIFFClose. A short write is remembered.
 TEST_F(ClientOpenTest, WritesAppendsAndReadsThroughThe32BitProcedures) {
     Client client;
     TIFF* tif = client.Open("w");
@@ -66,12 +67,10 @@ TEST_F(ClientOpenTest, WritesAppendsAndReadsThroughThe32BitProcedures) {
     ASSERT_TRUE(WritePages(tif, FileSpec{}));
     TIFFClose(tif);
     EXPECT_EQ(client.closes, 1);
-    client.stream.position = 0;
     ASSERT_NE(tif = client.Open("a"), nullptr);
     ASSERT_TRUE(WritePages(tif, FileSpec{}, 1));
     EXPECT_EQ(TIFFIOFailedPivlo(tif), 0);
     TIFFClose(tif);
-    client.stream.position = 0;
     ASSERT_NE(tif = client.Open("r"), nullptr);
     EXPECT_EQ(TIFFClientdataPivlo(tif), &client);
     EXPECT_EQ(TIFFNumberOfDirectories(tif), 2u);
@@ -79,25 +78,22 @@ TEST_F(ClientOpenTest, WritesAppendsAndReadsThroughThe32BitProcedures) {
     EXPECT_GT(TIFFReadEncodedStrip(tif, 0, strip.data(), -1), 0);
     TIFFClose(tif);
     EXPECT_EQ(client.closes, 3);
-}
 
-TEST_F(ClientOpenTest, ShortWriteIsRemembered) {
-    Client client;
-    client.shortWritesAfter = 40;
-    TIFF* tif = client.Open("w");
-    ASSERT_NE(tif, nullptr);
+    Client shortWriter;
+    shortWriter.shortWritesAfter = 40;
+    ASSERT_NE(tif = shortWriter.Open("w"), nullptr);
     WritePages(tif, FileSpec{});
     EXPECT_EQ(TIFFIOFailedPivlo(tif), 1);
     TIFFClose(tif);
 }
 
 // The context slot starts empty and keeps what the job puts there; strip
-// offsets and counts come as 32-bit values. Objects not opened here have
-// neither client data nor context.
-TEST_F(ClientOpenTest, ContextSlotAndOffsetsOf32Bits) {
+// offsets and counts come as 32-bit values; without host allocators the C
+// heap serves. Objects not opened here have neither client data nor context.
+TEST_F(ClientOpenTest, ContextSlotOffsetsOf32BitsAndTheCHeap) {
     Client client;
     client.stream.data = MakePages(1);
-    TIFF* tif = client.Open("rc");
+    TIFF* tif = client.Open("rc", false);
     ASSERT_NE(tif, nullptr);
     EXPECT_EQ(TIFFGetContextPivlo(tif), nullptr);
     int job = 0;
@@ -109,6 +105,9 @@ TEST_F(ClientOpenTest, ContextSlotAndOffsetsOf32Bits) {
     EXPECT_EQ(offset, TIFFGetStrileOffset(tif, 0));
     EXPECT_EQ(count, 16u * 8u);
     EXPECT_EQ(TIFFGetStrileOffset32(tif, 5, &offset), 0) << "index beyond the strips";
+    void* own = PivloMalloc(tif, 32);
+    EXPECT_NE(own, nullptr);
+    PivloFree(tif, own);
     TIFFClose(tif);
 
     TempFile file;
@@ -132,17 +131,6 @@ TEST_F(ClientOpenTest, RefusedOpenReturnsNothingWithoutCallingClose) {
         EXPECT_EQ(client.closes, 0);
         TestAllocator::Reset();
     }
-}
-
-TEST_F(ClientOpenTest, WithoutHostAllocatorsTheCHeapServes) {
-    Client client;
-    client.stream.data = MakePages(1);
-    TIFF* tif = client.Open("r", nullptr, nullptr);
-    ASSERT_NE(tif, nullptr);
-    void* own = PivloMalloc(tif, 32);
-    EXPECT_NE(own, nullptr);
-    PivloFree(tif, own);
-    TIFFClose(tif);
 }
 
 }  // namespace

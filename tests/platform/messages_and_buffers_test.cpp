@@ -14,9 +14,10 @@ namespace {
 using zantest::TestAllocator;
 using zantest::TestHost;
 
-// Each severity reaches the host sink with its level; formatted errors are
-// not cut, however long.
-TEST(HostMessages, EverySeverityReachesTheHostSink) {
+// Each severity reaches the host sink with its level, and formatted errors
+// are not cut, however long; without a sink errors and warnings go to
+// standard error and traces are dropped.
+TEST(HostMessages, EverySeverityReachesTheHostSinkOrStandardError) {
     TestHost host;
     const std::string big(5000, 'q');
     zanError(host.ctx(), "broken");
@@ -29,21 +30,21 @@ TEST(HostMessages, EverySeverityReachesTheHostSink) {
     EXPECT_EQ(host.messages[2].severity, PIVLO_TRACE);
     EXPECT_EQ(host.messages[2].level, 1);
     EXPECT_EQ(host.Errors(), (std::vector<std::string>{"broken", "Failed to set Artist=me\n", "<" + big + ">"}));
-}
 
-TEST(HostMessages, WithoutASinkErrorsAndWarningsGoToStandardError) {
-    ConversionContext ctx;
-    pivloInitContext(&ctx);
+    ConversionContext bare;
+    pivloInitContext(&bare);
     testing::internal::CaptureStderr();
-    zanError(&ctx, "disk full");
-    zanWarning(&ctx, "odd tag");
-    zanTrace(&ctx, "dropped", 1);
+    zanError(&bare, "disk full");
+    zanWarning(&bare, "odd tag");
+    zanTrace(&bare, "dropped", 1);
     const std::string err = testing::internal::GetCapturedStderr();
     EXPECT_NE(err.find("disk full"), std::string::npos);
     EXPECT_NE(err.find("odd tag"), std::string::npos);
     EXPECT_EQ(err.find("dropped"), std::string::npos);
 }
 
+// A fresh record is empty and has heap allocators that never answer a
+// request for nothing, or a shrink to nothing, without a block.
 TEST(HostBuffers, InitialisedRecordIsEmptyWithHeapAllocators) {
     ConversionContext ctx;
     std::memset(&ctx, 0x5A, sizeof ctx);
@@ -60,16 +61,8 @@ TEST(HostBuffers, InitialisedRecordIsEmptyWithHeapAllocators) {
     ctx.freeProc(shrunk);
 }
 
-TEST(HostBuffers, FrameBufferResetReleasesTheFrame) {
-    TestHost host;
-    host->frameData = TestAllocator::Alloc(128);
-    host->frameBufferSize = 128;
-    zanResetFrameBuffer(host.ctx());
-    EXPECT_EQ(host->frameData, nullptr);
-    EXPECT_EQ(host->frameBufferSize, 0u);
-    EXPECT_EQ(TestAllocator::LiveBlocks(), 0u);
-}
-
+// The work buffer is kept while big enough, grows on demand, keeps the old
+// one when growth is refused, and goes with the reset.
 TEST(HostBuffers, WorkBufferGrowsAndIsReleasedByTheReset) {
     TestHost host;
     void* small = pivloWorkBuffer(host.ctx(), 16);
@@ -86,9 +79,13 @@ TEST(HostBuffers, WorkBufferGrowsAndIsReleasedByTheReset) {
     zanResetWorkBuffer(host.ctx());
 }
 
+// Releasing the record frees the frame, the work buffer and what the job
+// handed over (the palette as one block), clearing the fields; a second
+// release finds nothing to free.
 TEST(HostBuffers, ReleaseContextFreesWhatTheJobHandedOver) {
     TestHost host;
-    host->frameData = TestAllocator::Alloc(10);
+    host->frameData = TestAllocator::Alloc(128);
+    host->frameBufferSize = 128;
     host->iccProfile = TestAllocator::Alloc(10);
     host->documentName = static_cast<char*>(TestAllocator::Alloc(10));
     host->imageDescription = static_cast<char*>(TestAllocator::Alloc(10));
@@ -98,6 +95,8 @@ TEST(HostBuffers, ReleaseContextFreesWhatTheJobHandedOver) {
     pivloWorkBuffer(host.ctx(), 10);
     pivloReleaseContext(host.ctx());
     EXPECT_EQ(TestAllocator::LiveBlocks(), 0u);
+    EXPECT_EQ(host->frameData, nullptr);
+    EXPECT_EQ(host->frameBufferSize, 0u);
     EXPECT_EQ(host->paletteBlue, nullptr);
     pivloReleaseContext(host.ctx());
 }

@@ -13,14 +13,19 @@ using zantest::TestAllocator;
 
 MetadataList* NewList() { return pivloCreateMetadataList(TestAllocator::Alloc, TestAllocator::Free); }
 
+// The list holds copies in order of arrival; without memory it is not
+// created, and without allocators it uses the C heap.
 TEST(MetadataList, KeepsCopiesInOrderOfArrival) {
+    TestAllocator::FailNthCall(1);
+    EXPECT_EQ(NewList(), nullptr);
+    TestAllocator::Reset();
     MetadataList* list = NewList();
     ASSERT_NE(list, nullptr);
     MetadataEntry entry{};
     entry.group = ZAN_METADATA_IMAGE;
+    entry.type = ZAN_METADATA_U32;
     for (uint32_t tag : {305u, 270u, 282u}) {
         entry.tag = tag;
-        entry.type = ZAN_METADATA_U32;
         entry.value.u32 = tag * 2;
         ASSERT_EQ(zanAddToMetadataList(nullptr, list, &entry), 1);
     }
@@ -34,6 +39,9 @@ TEST(MetadataList, KeepsCopiesInOrderOfArrival) {
     EXPECT_EQ(pivloMetadataListLength(list), 3u);
     pivloDestroyMetadataList(list);
     EXPECT_EQ(TestAllocator::LiveBlocks(), 0u);
+    MetadataList* heapList = pivloCreateMetadataList(nullptr, nullptr);
+    ASSERT_NE(heapList, nullptr);
+    pivloDestroyMetadataList(heapList);
 }
 
 // A refused entry (no memory for its copy, no list, no entry) leaves the
@@ -57,16 +65,6 @@ TEST(MetadataList, BlockBelongsToTheListOnceItsEntryIsAccepted) {
     EXPECT_STREQ(static_cast<const char*>(pivloMetadataListFirst(list)->value.block), "icc!");
     pivloDestroyMetadataList(list);
     EXPECT_EQ(TestAllocator::LiveBlocks(), 0u) << "the block went with the list";
-}
-
-// Without allocators the list uses the C heap.
-TEST(MetadataList, ListWithoutMemoryIsNotCreated) {
-    TestAllocator::FailNthCall(1);
-    EXPECT_EQ(NewList(), nullptr);
-    TestAllocator::Reset();
-    MetadataList* heapList = pivloCreateMetadataList(nullptr, nullptr);
-    ASSERT_NE(heapList, nullptr);
-    pivloDestroyMetadataList(heapList);
 }
 
 }  // namespace

@@ -13,6 +13,7 @@ namespace {
 using Bytes = std::vector<uint8_t>;
 
 TEST(RowConversions, EdgesOfEachConversion) {
+    // The line the host receives from each conversion at its edges.
     uint16_t palette[3 * 4] = {10, 11, 12, 13, 20, 21, 22, 23, 30, 31, 32, 33};
     struct Case {
         const char* what;

@@ -1,8 +1,10 @@
 // A writing job to any destination kind, and what libtiff reads back.
 #pragma once
 
+#include <gtest/gtest.h>
+
 #include <cstdio>
-#include <cstdlib>
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -108,50 +110,57 @@ inline std::vector<Bytes> PatternRows(uint32_t height, uint64_t rowBytes, uint32
     return rows;
 }
 
-// A tag of a page as libtiff reads it back, through TIFFGetField's usual
-// shapes. Opens the bytes on every call: simple, and the files are small.
-class PageReader {
-public:
-    PageReader(const Bytes& tiff, uint32_t page = 0) : file_() {
-        WriteFileBytes(file_.path(), tiff);
-        previous_ = TIFFSetErrorHandler(nullptr);
-        previousWarning_ = TIFFSetWarningHandler(nullptr);
-        tif_ = TIFFOpen(file_.c_str(), "r");
-        if (tif_ && page) TIFFSetDirectory(tif_, page);
-    }
-    ~PageReader() {
-        if (tif_) TIFFClose(tif_);
-        TIFFSetErrorHandler(previous_);
-        TIFFSetWarningHandler(previousWarning_);
-    }
-    TIFF* operator->() { return tif_; }
-    TIFF* get() { return tif_; }
-    uint32_t U16(uint32_t tag) {
-        uint16_t v = 0;
-        return TIFFGetField(tif_, tag, &v) ? v : 0xFFFFFFFFu;
-    }
-    uint32_t U32(uint32_t tag) {
-        uint32_t v = 0;
-        return TIFFGetField(tif_, tag, &v) ? v : 0xFFFFFFFFu;
-    }
-    float F32(uint32_t tag) {
-        float v = 0;
-        return TIFFGetField(tif_, tag, &v) ? v : -1.0f;
-    }
-    std::string Text(uint32_t tag) {
-        char* v = nullptr;
-        return TIFFGetField(tif_, tag, &v) && v ? v : "";
-    }
-    // Makes the page's EXIF directory current; false when it has none.
-    bool OpenExif() {
-        uint64_t offset = 0;
-        return TIFFGetField(tif_, TIFFTAG_EXIFIFD, &offset) && TIFFReadEXIFDirectory(tif_, offset);
-    }
+// The rows one after another, as libtiff decodes a page.
+inline Bytes Joined(const std::vector<Bytes>& rows) {
+    Bytes all;
+    for (const Bytes& row : rows) all.insert(all.end(), row.begin(), row.end());
+    return all;
+}
 
-private:
-    TempFile file_;
-    TIFF* tif_ = nullptr;
-    TIFFErrorHandler previous_ = nullptr, previousWarning_ = nullptr;
-};
+// What a reduction of 16-bit samples to 8 bits keeps: the high bytes.
+inline Bytes HighBytes(const Bytes& samples) {
+    Bytes high;
+    for (size_t i = 1; i < samples.size(); i += 2) high.push_back(samples[i]);
+    return high;
+}
+
+// Checks libtiff's listing of a directory (DumpPage's tags or exifTags): it
+// holds each of `lines` as a whole line, and no line starting with any of `absent`.
+inline void ExpectListing(const std::string& listing, const std::vector<std::string>& lines,
+                          const std::vector<std::string>& absent = {}) {
+    for (const std::string& line : lines)
+        EXPECT_NE(listing.find("  " + line + "\n"), std::string::npos) << "no \"" << line << "\" in\n" << listing;
+    for (const std::string& start : absent)
+        EXPECT_EQ(listing.find("  " + start), std::string::npos) << "\"" << start << "\" in\n" << listing;
+}
+
+// Whether the host was told of a failure, by the module or by the codec.
+inline bool Reported(const TestHost& host) { return !host.Errors().empty() || !host.codecErrors.empty(); }
+
+// For n = 1, 2, ...: makes a job, runs it with its nth allocating call
+// failing, and checks that a failed run was reported and that no block is
+// left once the job is gone. Ends after a run that made fewer than n calls
+// (and must have succeeded). `run` returns whether the job succeeded.
+template <typename Make, typename Run>
+void SweepAllocations(Make make, Run run) {
+    for (int n = 1;; ++n) {
+        int calls = 0;
+        bool succeeded = false;
+        {
+            auto job = make();
+            TestAllocator::Reset();
+            TestAllocator::FailNthCall(n);
+            succeeded = run(*job, n);
+            calls = TestAllocator::Calls();
+            EXPECT_TRUE(succeeded || Reported(job->host())) << "allocation " << n;
+        }
+        TestAllocator::Reset();
+        EXPECT_EQ(TestAllocator::LiveBlocks(), 0u) << "allocation " << n;
+        if (calls < n) {
+            EXPECT_TRUE(succeeded);
+            break;
+        }
+    }
+}
 
 }  // namespace zantest

@@ -66,6 +66,7 @@ struct TIFFStreamDecoder {
     osttiff::PageLayout layout;
     uint64_t* floorFrom = nullptr;  // per block: the lowest data offset of it and the blocks after it
     uint64_t keepUntil = std::numeric_limits<uint64_t>::max();
+    uint64_t directoryNeeds = 0;  // input the directory needs before it is scanned again
 
     // Bands.
     TIFFStreamRowReader reader{};
@@ -238,7 +239,10 @@ void LetGoBefore(Decoder* d, uint64_t position) {
 // Opens the page once its directory is held (or, the input having ended,
 // with whatever arrived). Status 3, 2 while more is needed, or 1/6.
 int OpenPage(Decoder* d) {
+    // Nothing new is learnt from the directory before what it needs arrived.
+    if (!d->ended && d->input.arrived() < d->directoryNeeds) return TIFF_STREAM_NEED_INPUT;
     const DirectoryScan scan = ScanFirstDirectory(d->input);
+    d->directoryNeeds = scan.needed;
     if (scan.state == DirectoryScan::State::kNeedMore && !d->ended) return TIFF_STREAM_NEED_INPUT;
     d->openedSize = std::max(scan.dataEnd, d->input.arrived());
     d->position = 0;
@@ -288,6 +292,11 @@ bool BeginRows(Decoder* d) {
     d->reading = true;  // from here `end` is owed, whatever follows
     if (d->rowBytes == 0) return false;
     d->rowWritten = std::max(d->rowWritten, d->rowBytes);
+    // A row is held whole: no larger than the input the decoder may hold.
+    if (d->rowWritten > kHeldInputLimit) {
+        TIFFErrorExt(nullptr, kModule, "A row of the page is larger than 1 GiB.");
+        return false;
+    }
     d->bandRows = static_cast<uint32_t>(std::max<uint64_t>(1, kBandBytes / d->rowBytes));
     d->bandRows = std::min(d->bandRows, std::max<uint32_t>(d->layout.height, 1));
     d->band = static_cast<uint8_t*>(Allocate(d, uint64_t{d->bandRows - 1} * d->rowBytes + d->rowWritten));
@@ -302,6 +311,12 @@ void EndRows(Decoder* d) {
     if (!d->reading) return;
     d->reading = false;
     if (d->reader.end) d->reader.end(d->reader.user);
+}
+
+// Whether the data of the page's first rows is there (or will never come):
+// reading is set up, and its buffers taken, only then.
+bool FirstRowsArrived(const Decoder* d) {
+    return d->ended || BlockEnd(d, d->layout.BlockOf(d->nextRow)) <= d->input.arrived();
 }
 
 // Rows from `nextRow` whose data has all arrived, at most a band's worth;
@@ -428,7 +443,7 @@ int DeliverBypassRows(Decoder* d) {
 // What the page needs next: the end of the input that completes the next
 // delivery (0 when anything that comes will do).
 uint64_t NextNeed(const Decoder* d) {
-    if (!d->tif) return ScanFirstDirectory(d->input).needed;
+    if (!d->tif) return d->directoryNeeds;
     if (d->mode == ZAN_STREAM_NO_DECOMPRESSION || d->mode == ZAN_STREAM_BYPASS) return 0;
     const PageLayout& page = d->layout;
     for (uint32_t block = page.BlockOf(d->nextRow); block < page.blocks; ++block) {
@@ -471,6 +486,7 @@ int Deliver(Decoder* d) {
         status = DeliverBypassRows(d);
     } else {
         if (d->nextRow >= d->layout.height) status = TIFF_STREAM_PAGE_DONE;
+        else if (!d->reading && !FirstRowsArrived(d)) status = TIFF_STREAM_NEED_INPUT;
         else if (!BeginRows(d)) return Fail(d, nullptr);
         else if (const uint32_t rows = RowsReady(d)) status = DeliverRows(d, rows);
         else status = TIFF_STREAM_NEED_INPUT;

@@ -179,6 +179,13 @@ TEST(StreamDecode, CallsOutOfOrderAreRefused) {
     zanTIFFStreamDecodeEnd(other.ctx());
     zanDestroyTIFF(host.ctx());
     EXPECT_EQ(host->streamDecoder, nullptr);
+    // A row the decoder would have to hold beyond its limit is refused
+    // before anything is sized from it.
+    const Streamed huge = StreamDecode(HugePage(1200u << 20, 1, 1, 8, 1300u << 10), 0);
+    EXPECT_EQ(huge.last, ZAN_STREAM_ERROR);
+    EXPECT_NE(std::find(huge.errors.begin(), huge.errors.end(), "TIFFStreamDecode:A row of the page is larger than 1 GiB."),
+              huge.errors.end())
+        << ::testing::PrintToString(huge.errors);
 }
 
 TEST(StreamDecode, AnySplitGivesTheReadersRowsAndOneChunkPagesTheirChunk) {

@@ -21,4 +21,8 @@ run info "$out/third.tif"
 run encode "$out/page1.png" "$out/page2.png" -o "$out/encoded.tif" --compression lzw --dpi 300
 run copy "$sample" -o "$out/copy.tif" --compression deflate
 run info "$out/copy.tif" --page 2
+run decode "$sample" --stream --chunk 4096 -o "$out/streamed.png"
+run encode "$out/page1.png" -o "$out/jpeg.tif" --compression jpeg
+run jpeg "$out/jpeg.tif" -o "$out/page1.jpg"
+run wrap "$out/page1.jpg" -o "$out/wrapped.tif" --dpi 150
 ls -l "$out"

@@ -356,13 +356,26 @@ int DeliverRows(Decoder* d, uint32_t rows) {
 
 // ---- raw delivery and bypass ----
 
-void TakeChunk(Decoder* d) {
-    int error = 0;
-    d->chunkOffset = TIFFGetStrileOffsetWithErr(d->tif, 0, &error);
-    d->chunkSize = error ? 0 : TIFFGetStrileByteCountWithErr(d->tif, 0, &error);
-    if (error || d->chunkSize > std::numeric_limits<uint64_t>::max() - d->chunkOffset) d->chunkSize = 0;
-    d->keepUntil = d->chunkOffset + d->chunkSize;
-    d->pendingDrop = d->chunkOffset;
+// The page's single chunk, for raw delivery and the bypass; false (reported)
+// when the page lists none with data.
+bool TakeChunk(Decoder* d) {
+    uint64_t offset = 0, end = 0;
+    if (!ChunkExtent(d, 0, &offset, &end)) {
+        TIFFErrorExt(nullptr, kModule, "The page's strip holds no data.");
+        return false;
+    }
+    d->chunkOffset = offset;
+    d->chunkSize = end - offset;
+    d->keepUntil = end;
+    d->pendingDrop = offset;
+    return true;
+}
+
+// The held bytes of the chunk from `from` on (none when they are not held).
+uint64_t ChunkBytesHeld(const Decoder* d, uint64_t from, const uint8_t** data) {
+    const uint64_t end = std::min(d->input.end(), d->chunkOffset + d->chunkSize);
+    *data = d->input.At(from);
+    return *data && end > from ? end - from : 0;
 }
 
 // The next piece of the chunk as stored: status 4, 5, 6, or 2.
@@ -371,10 +384,11 @@ int DeliverRawPiece(Decoder* d) {
     const uint64_t piece = d->ctx->rawBufferOutSize ? d->ctx->rawBufferOutSize : d->chunkSize;
     const uint64_t from = d->chunkOffset + d->chunkDelivered;
     const uint64_t wanted = std::min(piece, d->chunkSize - d->chunkDelivered);
-    const uint64_t arrived = d->input.arrived() > from ? d->input.arrived() - from : 0;
-    if (arrived < wanted && !(d->ended && arrived > 0)) return d->ended ? TIFF_STREAM_TRUNCATED : TIFF_STREAM_NEED_INPUT;
-    const uint64_t length = std::min(wanted, arrived);
-    d->ctx->rawOutput = const_cast<uint8_t*>(d->input.At(from));
+    const uint8_t* data = nullptr;
+    const uint64_t held = ChunkBytesHeld(d, from, &data);
+    if (held < wanted && !(d->ended && held > 0)) return d->ended ? TIFF_STREAM_TRUNCATED : TIFF_STREAM_NEED_INPUT;
+    const uint64_t length = std::min(wanted, held);
+    d->ctx->rawOutput = const_cast<uint8_t*>(data);
     d->ctx->rawOutputSize = static_cast<uint32_t>(length);
     d->chunkDelivered += length;
     d->pendingDrop = from + length;
@@ -406,10 +420,8 @@ int DeliverBypassRows(Decoder* d) {
         ctx->rowsDelivered = 0;
     }
     for (;;) {
-        const uint64_t from = d->chunkOffset + d->jpeg->consumed();
-        const uint64_t end = std::min(d->input.arrived(), d->chunkOffset + d->chunkSize);
-        const uint64_t available = end > from ? end - from : 0;
-        const uint8_t* data = available ? d->input.At(from) : nullptr;
+        const uint8_t* data = nullptr;
+        const uint64_t available = ChunkBytesHeld(d, d->chunkOffset + d->jpeg->consumed(), &data);
         uint32_t rows = 0;
         const uint32_t before = d->jpeg->rowsDecoded();
         const JpegBypass::Step step = d->jpeg->Run(data, static_cast<size_t>(available), d->ended, d->band,
@@ -477,7 +489,8 @@ int Deliver(Decoder* d) {
     if (!d->started) {
         d->started = true;
         d->mode = d->ctx->streamMode;
-        if (d->mode == ZAN_STREAM_NO_DECOMPRESSION || d->mode == ZAN_STREAM_BYPASS) TakeChunk(d);
+        if ((d->mode == ZAN_STREAM_NO_DECOMPRESSION || d->mode == ZAN_STREAM_BYPASS) && !TakeChunk(d))
+            return Fail(d, nullptr);
     }
     int status = 0;
     if (d->mode == ZAN_STREAM_NO_DECOMPRESSION) {

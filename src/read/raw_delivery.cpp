@@ -61,6 +61,7 @@ bool RawDelivery::Begin(uint64_t bound, const char* memoryMessage) {
 }
 
 bool RawDelivery::Write(const void* data, uint32_t n) {
+    if (n == 0) return true;  // an empty piece (its data may be null) writes nothing
     switch (ctx_->destKind) {
     case ZAN_DEST_FILE:
         if (std::fwrite(data, 1, n, ctx_->destFp) != n) return ReportError(ctx_, kFileAccess);

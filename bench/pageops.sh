@@ -30,8 +30,9 @@ measure() {
     local start end
     start=$(date +%s%N)
     # A reference that fails would measure nothing: stop instead.
-    if ! /usr/bin/time -f '%M' -o "$work/time" "$@" >/dev/null 2>&1; then
+    if ! /usr/bin/time -f '%M' -o "$work/time" "$@" >/dev/null 2>"$work/stderr"; then
       echo "pageops.sh: failed: $*" >&2
+      cat "$work/stderr" >&2
       exit 1
     fi
     end=$(date +%s%N)
@@ -61,11 +62,13 @@ row "start-up: extract a small page" "$(measure "rm -f $work/one.tif" "$tool" ex
     tiffcp "$(measure "rm -f $work/one.tif" tiffcp "$work/small.tif,0" "$work/one.tif")"
 
 # Every page of the 200-page file into its own file; the plain copy of the
-# same bytes into 200 files is coreutils' split.
-z=$(measure "rm -f $work/p*" "$tool" split "$work/multi.tif" -o "$work/p")
-row "split 200 pages" "$z" tiffsplit "$(measure "rm -f $work/p*" tiffsplit "$work/multi.tif" "$work/p")"
+# same bytes into 200 files is coreutils' split. The pieces go to their own
+# folder, so that clearing them between runs touches no other input.
+mkdir "$work/pieces"
+z=$(measure "rm -f $work/pieces/*" "$tool" split "$work/multi.tif" -o "$work/pieces/p")
+row "split 200 pages" "$z" tiffsplit "$(measure "rm -f $work/pieces/*" tiffsplit "$work/multi.tif" "$work/pieces/p")"
 row "split 200 pages" "$z" "split -n 200 (same bytes)" \
-    "$(measure "rm -f $work/p*" split -n 200 "$work/multi.tif" "$work/p")"
+    "$(measure "rm -f $work/pieces/*" split -n 200 "$work/multi.tif" "$work/pieces/p")"
 
 # Every page of the 200-page file, one command a page (process start-up,
 # the first row, is part of each).

@@ -85,4 +85,15 @@ TIFF* OpenMemoryWithLibtiff(const Bytes& bytes, const char* mode) {
     return tif;
 }
 
+void ReadRowsAndRelease(benchmark::State& state, ConversionContext* ctx, Bytes& line, uint32_t rows) {
+    for (uint32_t y = 0; y < rows; ++y)
+        if (!zanTIFFReadNextScanLine(ctx, line.data(), static_cast<uint32_t>(line.size()))) {
+            state.SkipWithError("read failed");
+            break;
+        }
+    benchmark::DoNotOptimize(line.data());
+    zanDestroyTIFF(ctx);
+    pivloReleaseContext(ctx);
+}
+
 }  // namespace zanbench

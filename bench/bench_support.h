@@ -5,7 +5,11 @@
 #include <string>
 #include <vector>
 
+#include <benchmark/benchmark.h>
 #include <tiffio.h>
+
+#include "pivlo/pivlo.h"
+#include "zantiff/zantiff.h"
 
 namespace zanbench {
 
@@ -21,5 +25,9 @@ std::string WriteTemporary(const Bytes& bytes, const std::string& name);
 // libtiff's own client over bytes in memory (64-bit procedures), the
 // reference the 32-bit module procedures are compared with.
 TIFF* OpenMemoryWithLibtiff(const Bytes& bytes, const char* mode);
+
+// Reads `rows` lines of the job's page into `line` (a failure ends the case
+// with an error), then tears the job down.
+void ReadRowsAndRelease(benchmark::State& state, ConversionContext* ctx, Bytes& line, uint32_t rows);
 
 }  // namespace zanbench

@@ -12,6 +12,7 @@
 
 #include <tiffio.h>
 
+#include "bench_support.h"
 #include "pivlo/pivlo.h"
 #include "zantiff/zantiff.h"
 
@@ -74,14 +75,7 @@ void Module(benchmark::State& state, Kind kind) {
         ctx.sourceKind = ZAN_SOURCE_FILE;
         ctx.sourceFp = fp;
         ctx.outputBitsPerSample = 8;
-        for (uint32_t y = 0; y < kSize; ++y)
-            if (!zanTIFFReadNextScanLine(&ctx, line.data(), static_cast<uint32_t>(line.size()))) {
-                state.SkipWithError("read failed");
-                break;
-            }
-        benchmark::DoNotOptimize(line.data());
-        zanDestroyTIFF(&ctx);
-        pivloReleaseContext(&ctx);
+        zanbench::ReadRowsAndRelease(state, &ctx, line, kSize);
         std::fclose(fp);
     }
     state.SetItemsProcessed(state.iterations() * kSize);

@@ -196,14 +196,7 @@ void Reader(benchmark::State& state, bool fromFile) {
             ctx.sourceMemorySize = static_cast<uint32_t>(page.size());
         }
         ctx.pageNumber = 1;
-        for (uint32_t y = 0; y < kSize; ++y)
-            if (!zanTIFFReadNextScanLine(&ctx, line.data(), static_cast<uint32_t>(line.size()))) {
-                state.SkipWithError("read failed");
-                break;
-            }
-        benchmark::DoNotOptimize(line.data());
-        zanDestroyTIFF(&ctx);
-        pivloReleaseContext(&ctx);
+        zanbench::ReadRowsAndRelease(state, &ctx, line, kSize);
         if (fp) std::fclose(fp);
     }
     ReportPeak(state);

@@ -26,6 +26,13 @@ public:
     ConversionContext* operator->() { return &ctx_; }
     ConversionContext* get() { return &ctx_; }
 
+    // Makes the job read page `page` (from 1) of the open file `source`.
+    void ReadPage(FILE* source, int page) {
+        ctx_.sourceKind = ZAN_SOURCE_FILE;
+        ctx_.sourceFp = source;
+        ctx_.pageNumber = page;
+    }
+
     // Keeps messages instead of printing them; Print() shows them later.
     void Quiet() { quiet_ = true; }
     void Print() const;

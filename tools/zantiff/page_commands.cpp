@@ -69,9 +69,7 @@ unsigned CountPages(const std::string& source) {
     File in = OpenFile(source, "rb");
     if (!in) return 0;
     Job job;
-    job->sourceKind = ZAN_SOURCE_FILE;
-    job->sourceFp = in.get();
-    job->pageNumber = 1;
+    job.ReadPage(in.get(), 1);
     return zanTIFFGetInfo(job.get()) ? job->pageCount : 0;
 }
 

@@ -173,9 +173,7 @@ bool InfoOne(const std::string& path, int page, bool json, bool several) {
     if (!in) return false;
     Job job;
     MetadataList* list = pivloCreateMetadataList(nullptr, nullptr);
-    job->sourceKind = ZAN_SOURCE_FILE;
-    job->sourceFp = in.get();
-    job->pageNumber = page;
+    job.ReadPage(in.get(), page);
     job->metadataList = list;
     const int described = zanTIFFGetInfo(job.get());
     if (described) {
@@ -299,9 +297,7 @@ int Decode(const std::string& path, int page, const std::string& outPath) {
     File in = OpenFile(path, "rb");
     if (!in) return 1;
     Job job;
-    job->sourceKind = ZAN_SOURCE_FILE;
-    job->sourceFp = in.get();
-    job->pageNumber = page;
+    job.ReadPage(in.get(), page);
     job->outputBitsPerSample = 16;
     if (!zanTIFFGetInfo(job.get())) return 1;
     // Room for the longest line any page kind gives: 16-bit samples, or
@@ -400,9 +396,7 @@ int DecodeFrame(const std::string& path, int page, const std::string& outPath) {
     File in = OpenFile(path, "rb");
     if (!in) return 1;
     Job job;
-    job->sourceKind = ZAN_SOURCE_FILE;
-    job->sourceFp = in.get();
-    job->pageNumber = page;
+    job.ReadPage(in.get(), page);
     if (!zanTIFFGetInfo(job.get())) return 1;
     job->outputBitsPerSample = job->bitsPerSample > 8 ? 16 : 8;
     uint32_t direct = 0;
@@ -417,9 +411,7 @@ int PassThrough(const std::string& path, int page, const std::string& outPath, u
     File in = OpenFile(path, "rb");
     if (!in) return 1;
     Job job;
-    job->sourceKind = ZAN_SOURCE_FILE;
-    job->sourceFp = in.get();
-    job->pageNumber = page;
+    job.ReadPage(in.get(), page);
     job->destFormat = destFormat;
     job->destKind = ZAN_DEST_FILE;
     job->destPath = outPath.c_str();

@@ -24,10 +24,10 @@ struct JpegPageSpec {
 // The page's pixels: a gradient with some texture.
 uint8_t JpegSourceSample(uint32_t x, uint32_t y, int component);
 
-// One-page TIFF whose strips are JPEG streams of the spec.
+// One-page TIFF laid out as `spec` describes, its strips JPEG streams.
 Bytes MakeJpegTiff(const JpegPageSpec& spec);
 
-// One whole JPEG stream of the spec's page (its strips ignored): components
+// One whole JPEG stream of the page `page` describes (its strips ignored): components
 // 1 grey, 3 YCbCr (or RGB), 4 CMYK; `cbH`/`cbV` and `crH`/`crV` the chroma
 // sampling; a JFIF density of `density` (unit `densityUnit`: 1 inch, 2 cm).
 struct JpegStreamSpec {

@@ -24,9 +24,9 @@ using zan::OpenTIFFForReading;
 using zan::OpenTIFFForWriting;
 
 // Three pages: grey, wider grey, LZW-compressed RGB.
-FileSpec ThreePages() {
-    FileSpec file;
-    file.pages.assign(3, PageSpec{});
+FileLayout ThreePages() {
+    FileLayout file;
+    file.pages.assign(3, PageLayout{});
     file.pages[1].width = 24;
     file.pages[2].samplesPerPixel = 3;
     file.pages[2].photometric = PHOTOMETRIC_RGB;
@@ -303,8 +303,8 @@ TEST(WritingOpen, SecondPageGoesBehindTheFirstOrFailsWithoutReadBack) {
             host->sourceReadProc = nullptr;
         }
         ASSERT_EQ(OpenTIFFForWriting(host.ctx()), 1);
-        if (!append) { ASSERT_TRUE(WritePages(host->tiff, FileSpec{})); }
-        FileSpec second;
+        if (!append) { ASSERT_TRUE(WritePages(host->tiff, FileLayout{})); }
+        FileLayout second;
         second.pages[0].width = 9;
         EXPECT_EQ(WritePages(host->tiff, second, 1), append);
         EXPECT_EQ(host.HasError("Destination cannot be read back: a source read function is needed to add a page"),
@@ -361,9 +361,9 @@ TEST(WritingOpen, DestinationThatCannotBeOpenedIsRefusedWithItsReason) {
 // A page too big for the buffer, or a buffer too small for the header: the
 // open or the write fails with a report, and nothing lands past the capacity.
 TEST(FixedBuffer, WritingPastTheCapacityFailsWithoutOverflow) {
-    FileSpec big;
+    FileLayout big;
     big.pages[0].width = big.pages[0].height = 64;
-    for (const auto& [capacity, file] : {std::pair{200u, big}, std::pair{4u, FileSpec{}}}) {
+    for (const auto& [capacity, file] : {std::pair{200u, big}, std::pair{4u, FileLayout{}}}) {
         SCOPED_TRACE(capacity);
         TestHost host;
         DestinationFixture dest(host, DestKind::FixedBuffer, capacity);
@@ -421,11 +421,11 @@ TEST(Teardown, GrowingImageIsHandedOverOnceWithThePageInProgress) {
 // A memory source is never taken for the memory image, even with a memory
 // destination set for a pass-through delivery.
 TEST(Teardown, ReaderBuffersAreReleasedAndTheMemorySourceIsLeftAlone) {
-    FileSpec tiled, palette;
+    FileLayout tiled, palette;
     tiled.pages[0].tileWidth = tiled.pages[0].tileHeight = 16;
     palette.pages[0].photometric = PHOTOMETRIC_PALETTE;
     for (int i = 0; i < 768; ++i) palette.pages[0].colorMap.push_back(static_cast<uint16_t>(i * 85));
-    for (const FileSpec& file : {tiled, palette}) {
+    for (const FileLayout& file : {tiled, palette}) {
         TestHost host;
         SourceFixture source(host, SourceKind::Memory, MakeTiff(file));
         void* out = nullptr;

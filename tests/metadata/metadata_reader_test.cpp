@@ -46,8 +46,8 @@ private:
 };
 
 Bytes DescribedPage() {
-    FileSpec file;
-    PageSpec& p = file.pages[0];
+    FileLayout file;
+    PageLayout& p = file.pages[0];
     p.description = "described";
     p.documentName = "name";
     p.xResolution = 300;

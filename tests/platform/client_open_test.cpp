@@ -64,11 +64,11 @@ TEST_F(ClientOpenTest, WritesAppendsAndReadsThroughThe32BitProcedures) {
     Client client;
     TIFF* tif = client.Open("w");
     ASSERT_NE(tif, nullptr);
-    ASSERT_TRUE(WritePages(tif, FileSpec{}));
+    ASSERT_TRUE(WritePages(tif, FileLayout{}));
     TIFFClose(tif);
     EXPECT_EQ(client.closes, 1);
     ASSERT_NE(tif = client.Open("a"), nullptr);
-    ASSERT_TRUE(WritePages(tif, FileSpec{}, 1));
+    ASSERT_TRUE(WritePages(tif, FileLayout{}, 1));
     EXPECT_EQ(TIFFIOFailedPivlo(tif), 0);
     TIFFClose(tif);
     ASSERT_NE(tif = client.Open("r"), nullptr);
@@ -82,7 +82,7 @@ TEST_F(ClientOpenTest, WritesAppendsAndReadsThroughThe32BitProcedures) {
     Client shortWriter;
     shortWriter.shortWritesAfter = 40;
     ASSERT_NE(tif = shortWriter.Open("w"), nullptr);
-    WritePages(tif, FileSpec{});
+    WritePages(tif, FileLayout{});
     EXPECT_EQ(TIFFIOFailedPivlo(tif), 1);
     TIFFClose(tif);
 }

@@ -26,15 +26,15 @@ Bytes Frame(ReadJob& job) {
 
 TEST(FrameDecode, RgbaFramesAreLibtiffsDecodePacked) {
     // The frame and its description, from every source kind.
-    PageSpec upsideDown = Page(9, 6, 3, PHOTOMETRIC_RGB);
+    PageLayout upsideDown = Page(9, 6, 3, PHOTOMETRIC_RGB);
     upsideDown.orientation = ORIENTATION_BOTLEFT;
-    PageSpec mirrored = upsideDown;
+    PageLayout mirrored = upsideDown;
     mirrored.orientation = ORIENTATION_TOPRIGHT;
-    PageSpec palette = Page(12, 7, 1, PHOTOMETRIC_PALETTE);
+    PageLayout palette = Page(12, 7, 1, PHOTOMETRIC_PALETTE);
     for (int i = 0; i < 768; ++i) palette.colorMap.push_back(static_cast<uint16_t>((i * 97 % 256) * 257));
     const struct Case {
         const char* what;
-        PageSpec page;
+        PageLayout page;
         uint32_t format, colorSpace, samples, whiteIsZero;
     } cases[] = {
         {"RGB, LZW", Page(37, 21, 3, PHOTOMETRIC_RGB, 8, COMPRESSION_LZW), 8, 8, 3, 0},
@@ -71,7 +71,7 @@ TEST(FrameDecode, RgbaFramesAreLibtiffsDecodePacked) {
 // WantRow delivers them), rows top first: pixel by pixel, or plane after
 // plane. Three 1-bit planes asked for as a 4-bit palette image become one
 // index of their bits, two pixels a byte.
-Bytes WantFrame(PageSpec p, uint32_t samples, uint32_t bits, bool planes) {
+Bytes WantFrame(PageLayout p, uint32_t samples, uint32_t bits, bool planes) {
     Bytes frame;
     if (bits == 4) {
         frame.resize((p.width + 1) / 2 * p.height);
@@ -96,17 +96,17 @@ Bytes WantFrame(PageSpec p, uint32_t samples, uint32_t bits, bool planes) {
 TEST(FrameDecode, FramesThatKeepTheSamples) {
     // 16-bit frames the RGBA way, the page's own samples the native way, and
     // three 1-bit planes as the 4-bit palette image the host asked for.
-    PageSpec rgba16 = Page(10, 6, 4, PHOTOMETRIC_RGB, 16);
+    PageLayout rgba16 = Page(10, 6, 4, PHOTOMETRIC_RGB, 16);
     rgba16.extraSamples = {EXTRASAMPLE_UNASSALPHA};
-    const PageSpec tiledPlanes = Tiled(Page(20, 18, 3, PHOTOMETRIC_RGB, 16, COMPRESSION_LZW, PLANARCONFIG_SEPARATE));
-    PageSpec rgba = Page(9, 7, 4, PHOTOMETRIC_RGB);
+    const PageLayout tiledPlanes = Tiled(Page(20, 18, 3, PHOTOMETRIC_RGB, 16, COMPRESSION_LZW, PLANARCONFIG_SEPARATE));
+    PageLayout rgba = Page(9, 7, 4, PHOTOMETRIC_RGB);
     rgba.extraSamples = {EXTRASAMPLE_ASSOCALPHA};
-    PageSpec palette = Page(12, 7, 1, PHOTOMETRIC_PALETTE);
+    PageLayout palette = Page(12, 7, 1, PHOTOMETRIC_PALETTE);
     for (int i = 0; i < 768; ++i) palette.colorMap.push_back(static_cast<uint16_t>(i * 85));
-    const PageSpec rgb16 = Page(6, 5, 3, PHOTOMETRIC_RGB, 16);
+    const PageLayout rgb16 = Page(6, 5, 3, PHOTOMETRIC_RGB, 16);
     const struct Case {
         const char* what;
-        PageSpec page;
+        PageLayout page;
         uint32_t native, outputBits, drop;
         uint32_t format, samples, bits, planar;
     } cases[] = {
@@ -185,7 +185,7 @@ TEST(FrameDecode, RefusalsTheirMessagesAndWhatIsLeft) {
 
 TEST(FrameDecode, EveryAllocationCanFailCleanly) {
     // A failed call reports, and leaves no frame and no block behind.
-    PageSpec palette = Page(12, 7, 1, PHOTOMETRIC_PALETTE);
+    PageLayout palette = Page(12, 7, 1, PHOTOMETRIC_PALETTE);
     palette.colorMap.assign(768, 9);
     for (const Bytes& tiff : {OnePage(Page(9, 7, 3, PHOTOMETRIC_RGB, 8, COMPRESSION_LZW)), OnePage(palette)})
         for (uint32_t native : {0u, 1u})

@@ -7,9 +7,9 @@ namespace {
 using namespace zantest;
 
 Bytes ThreeWidths() {
-    FileSpec spec;
-    spec.pages = {Page(10, 8), Page(20, 8), Page(30, 8)};
-    return MakeTiff(spec);
+    FileLayout layout;
+    layout.pages = {Page(10, 8), Page(20, 8), Page(30, 8)};
+    return MakeTiff(layout);
 }
 
 TEST(PageSelection, PageNumberChoosesThePageDescribed) {
@@ -72,7 +72,7 @@ TEST(PageDescription, PhotometricAndResolutionInTheHostsCodes) {
     };
     for (const Case& c : cases) {
         SCOPED_TRACE(c.photometric);
-        PageSpec p = Page(4, 2, c.samples, c.photometric, c.bits);
+        PageLayout p = Page(4, 2, c.samples, c.photometric, c.bits);
         p.xResolution = 100;
         p.yResolution = 50;
         p.resolutionUnit = c.unit;
@@ -98,9 +98,9 @@ TEST(PageDescription, PhotometricAndResolutionInTheHostsCodes) {
 TEST(PageDescription, CompressionTilesTextsAndProfileAndTheirReplacement) {
     // Copies come from the job's allocator; the next page's description
     // replaces them.
-    FileSpec spec;
-    spec.pages.assign(2, Page(40, 40));
-    PageSpec& p = spec.pages[0];
+    FileLayout layout;
+    layout.pages.assign(2, Page(40, 40));
+    PageLayout& p = layout.pages[0];
     p.compression = COMPRESSION_LZW;
     p.tileWidth = 16;
     p.tileHeight = 32;
@@ -108,7 +108,7 @@ TEST(PageDescription, CompressionTilesTextsAndProfileAndTheirReplacement) {
     p.documentName = "doc";
     p.iccProfile = Bytes(300, 0x42);
     p.fillOrder = FILLORDER_LSB2MSB;
-    ReadJob job(MakeTiff(spec));
+    ReadJob job(MakeTiff(layout));
     job->pageNumber = 1;
     ASSERT_EQ(job.GetInfo(), 1);
     EXPECT_EQ(job->compression, static_cast<uint32_t>(ZAN_COMPRESSION_LZW));

@@ -264,10 +264,10 @@ Bytes PassedThrough(const Bytes& tiff, uint32_t destFormat) {
 TEST(RoundTrips, StreamsTakenFromPagesAndWrappedAgainComeBackUnchanged) {
     // JPEG pages of every colour kind, and the corpus's one-strip Group 4
     // pages, whose wrapped stream also decodes to the page's pixels.
-    for (const JpegPageSpec& spec : {JpegPageSpec{}, JpegPageSpec{.h = 1, .v = 1, .rgb = true},
-                                     JpegPageSpec{.components = 1, .h = 1, .v = 1}}) {
-        SCOPED_TRACE(::testing::Message() << spec.components << spec.rgb);
-        const Bytes stream = PassedThrough(MakeJpegTiff(spec), ZAN_DEST_FORMAT_JPEG);
+    for (const JpegPageLayout& layout : {JpegPageLayout{}, JpegPageLayout{.h = 1, .v = 1, .rgb = true},
+                                     JpegPageLayout{.components = 1, .h = 1, .v = 1}}) {
+        SCOPED_TRACE(::testing::Message() << layout.components << layout.rgb);
+        const Bytes stream = PassedThrough(MakeJpegTiff(layout), ZAN_DEST_FORMAT_JPEG);
         ASSERT_FALSE(stream.empty());
         EXPECT_EQ(PassedThrough(Wrapped(stream, true), ZAN_DEST_FORMAT_JPEG), stream);
     }

@@ -75,11 +75,11 @@ private:
     TestHost host_;
 };
 
-inline PageSpec Page(uint32_t width, uint32_t height, uint16_t samples = 1,
+inline PageLayout Page(uint32_t width, uint32_t height, uint16_t samples = 1,
                      uint16_t photometric = PHOTOMETRIC_MINISBLACK, uint16_t bits = 8,
                      uint16_t compression = COMPRESSION_NONE, uint16_t planar = PLANARCONFIG_CONTIG,
                      uint32_t rowsPerStrip = 4) {
-    PageSpec p;
+    PageLayout p;
     p.width = width;
     p.height = height;
     p.samplesPerPixel = samples;
@@ -91,21 +91,21 @@ inline PageSpec Page(uint32_t width, uint32_t height, uint16_t samples = 1,
     return p;
 }
 
-inline PageSpec Tiled(PageSpec p, uint32_t size = 16) {
+inline PageLayout Tiled(PageLayout p, uint32_t size = 16) {
     p.tileWidth = p.tileHeight = size;
     return p;
 }
 
-inline Bytes OnePage(const PageSpec& page) {
-    FileSpec spec;
-    spec.pages[0] = page;
-    return MakeTiff(spec);
+inline Bytes OnePage(const PageLayout& page) {
+    FileLayout layout;
+    layout.pages[0] = page;
+    return MakeTiff(layout);
 }
 
 // A Group 4 page of `photometric`, in one strip unless told otherwise.
 inline Bytes G4Page(uint32_t width, uint32_t height, uint16_t photometric = PHOTOMETRIC_MINISWHITE,
                     uint32_t rowsPerStrip = 0, uint32_t tile = 0, uint16_t fillOrder = 0) {
-    PageSpec p = Tiled(Page(width, height, 1, photometric, 1, COMPRESSION_CCITTFAX4, PLANARCONFIG_CONTIG,
+    PageLayout p = Tiled(Page(width, height, 1, photometric, 1, COMPRESSION_CCITTFAX4, PLANARCONFIG_CONTIG,
                             rowsPerStrip ? rowsPerStrip : height), tile);
     p.fillOrder = fillOrder;
     return OnePage(p);
@@ -126,7 +126,7 @@ inline Bytes HugePage(uint32_t width, uint32_t height, uint16_t samples, uint16_
 // narrower samples widened to bytes (2 bits times 85, 4 bits times 17),
 // 16-bit ones whole in host order when 16 bits are asked for and else by
 // their high byte, separate planes one after another.
-inline Bytes WantRow(const PageSpec& p, uint32_t y, uint32_t outputBits = 8) {
+inline Bytes WantRow(const PageLayout& p, uint32_t y, uint32_t outputBits = 8) {
     const uint32_t bits = p.bitsPerSample, samples = p.samplesPerPixel;
     Bytes row(bits == 1 ? (p.width + 7) / 8 : 0);
     if (bits == 1) {

@@ -13,9 +13,9 @@ namespace {
 using namespace zantest;
 
 Bytes TwoPagesSecondSevenWide() {
-    FileSpec spec;
-    spec.pages = {Page(16, 8), Page(7, 8)};
-    return MakeTiff(spec);
+    FileLayout layout;
+    layout.pages = {Page(16, 8), Page(7, 8)};
+    return MakeTiff(layout);
 }
 
 TEST(ScanlineReader, RowsOfEachPageKindFromEverySource) {
@@ -25,7 +25,7 @@ TEST(ScanlineReader, RowsOfEachPageKindFromEverySource) {
     };
     const struct Case {
         const char* what;
-        PageSpec page;
+        PageLayout page;
         uint32_t outputBits;
         bool streamBufferToo = true;  // see the note below
     } cases[] = {
@@ -60,7 +60,7 @@ TEST(ScanlineReader, RowsOfEachPageKindFromEverySource) {
 
 TEST(ScanlineReader, PaletteEntriesAreScaledOnlyWhenWide) {
     // Entries of at most 255 are used as they are; wider ones are scaled.
-    PageSpec p = Page(6, 2, 1, PHOTOMETRIC_PALETTE);
+    PageLayout p = Page(6, 2, 1, PHOTOMETRIC_PALETTE);
     const auto index = static_cast<uint8_t>(PixelValue(0, 1, 0, 0, 8));
     std::vector<uint16_t> narrow(768), wide(768, 0);
     for (int i = 0; i < 768; ++i) narrow[i] = static_cast<uint16_t>(i % 256);
@@ -87,7 +87,7 @@ TEST(ScanlineReader, AlphaIsDividedOutAndExtraSamplesDroppedOnRequest) {
             for (Source source : {Source::Memory, Source::StreamBuffer}) {
                 SCOPED_TRACE(::testing::Message() << (tagged ? "tagged" : "untagged") << ", drop " << drop
                                                   << ", source " << static_cast<int>(source));
-                PageSpec p = Page(4, 2, 4, PHOTOMETRIC_RGB);
+                PageLayout p = Page(4, 2, 4, PHOTOMETRIC_RGB);
                 if (tagged) p.extraSamples = {EXTRASAMPLE_ASSOCALPHA};
                 ReadJob described(OnePage(p), source);
                 described->dropExtraSamples = drop;
@@ -201,9 +201,9 @@ TEST(ScanlineReaderStates, RefusalsAndTheEndOfThePage) {
 TEST(ScanlineReaderStates, PagesItCannotTakeAreRefusedWithTheirMessages) {
     // No line and the message; the reader closes what it opened itself, and a
     // page described by zanTIFFGetInfo stays open and described.
-    PageSpec palette16 = Page(16, 8, 1, PHOTOMETRIC_PALETTE, 16);
+    PageLayout palette16 = Page(16, 8, 1, PHOTOMETRIC_PALETTE, 16);
     palette16.colorMap.assign(3 * 65536, 0);
-    PageSpec fourSamplePalette = Page(16, 8, 4, PHOTOMETRIC_PALETTE, 8);  // would overrun the RGB work line
+    PageLayout fourSamplePalette = Page(16, 8, 4, PHOTOMETRIC_PALETTE, 8);  // would overrun the RGB work line
     fourSamplePalette.colorMap.assign(3 * 256, 0);
     const struct Case {
         Bytes tiff;
@@ -268,9 +268,9 @@ TEST(ScanlineReaderStates, EveryAllocationOfDescriptionAndSetUpCanFail) {
     // Page kinds whose set-up allocates differently, and a page whose texts
     // and profile the description copies; described first or not. A failed
     // description closes the page; a failed read reports.
-    PageSpec palette = Page(16, 8, 1, PHOTOMETRIC_PALETTE);
+    PageLayout palette = Page(16, 8, 1, PHOTOMETRIC_PALETTE);
     palette.colorMap.assign(768, 7);
-    PageSpec texts = Page(16, 8);
+    PageLayout texts = Page(16, 8);
     texts.description = "d";
     texts.documentName = "n";
     texts.iccProfile = Bytes(16, 1);

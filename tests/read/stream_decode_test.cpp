@@ -161,7 +161,7 @@ TEST(StreamDecode, CallsOutOfOrderAreRefused) {
     EXPECT_EQ(zanTIFFStreamDecodeSetNoDecompression(host.ctx()), 0);
     EXPECT_EQ(zanTIFFStreamDecodeSetBypassLibTiff(host.ctx()), 0);
     ASSERT_EQ(zanTIFFStreamDecodeInit(host.ctx(), nullptr), 2);
-    const Bytes tiff = MakeTiff(FileSpec{});
+    const Bytes tiff = MakeTiff(FileLayout{});
     chunk.input = tiff.data();
     chunk.inputLength = 5;
     EXPECT_EQ(zanTIFFStreamDecode(host.ctx(), &chunk), ZAN_STREAM_CONTINUE);
@@ -193,7 +193,7 @@ TEST(StreamDecode, AnySplitGivesTheReadersRowsAndOneChunkPagesTheirChunk) {
     // description, and the mode and chunk type the host sees. A one-chunk
     // page raw, as stored, in pieces of the size asked for; a JPEG chunk
     // through libjpeg as libjpeg decodes it (a Group 4 chunk cannot take that way).
-    PageSpec palette = Page(37, 29, 1, PHOTOMETRIC_PALETTE, 4, COMPRESSION_LZW);
+    PageLayout palette = Page(37, 29, 1, PHOTOMETRIC_PALETTE, 4, COMPRESSION_LZW);
     for (int i = 0; i < 48; ++i) palette.colorMap.push_back(static_cast<uint16_t>(i * 1361));
     const struct Case {
         const char* what;
@@ -281,7 +281,7 @@ TEST(StreamDecode, InksAreStretchedFromTheDotRange) {
 
 TEST(StreamDecode, EveryAllocationCanFailCleanly) {
     // A decode that meets a failure ends with a message.
-    PageSpec palette = Page(16, 8, 1, PHOTOMETRIC_PALETTE, 4);
+    PageLayout palette = Page(16, 8, 1, PHOTOMETRIC_PALETTE, 4);
     for (int i = 0; i < 48; ++i) palette.colorMap.push_back(static_cast<uint16_t>(i * 999));
     const Bytes tiff = OnePage(palette);
     FailEachAllocation([&](int n) {

@@ -31,39 +31,39 @@ uint8_t JpegSourceSample(uint32_t x, uint32_t y, int component) {
     return static_cast<uint8_t>((x * 3 + y * 2 + component * 60 + (x * y) % 7) & 0xFF);
 }
 
-Bytes MakeJpegTiff(const JpegPageSpec& spec) {
+Bytes MakeJpegTiff(const JpegPageLayout& layout) {
     jpeg_compress_struct c{};
     jpeg_error_mgr errors{};
     c.err = jpeg_std_error(&errors);
     jpeg_create_compress(&c);
-    c.image_width = spec.width;
-    c.input_components = spec.components;
-    c.in_color_space = spec.components == 1 ? JCS_GRAYSCALE : JCS_RGB;
+    c.image_width = layout.width;
+    c.input_components = layout.components;
+    c.in_color_space = layout.components == 1 ? JCS_GRAYSCALE : JCS_RGB;
     jpeg_set_defaults(&c);
-    if (spec.components == 3) jpeg_set_colorspace(&c, spec.rgb ? JCS_RGB : JCS_YCbCr);
+    if (layout.components == 3) jpeg_set_colorspace(&c, layout.rgb ? JCS_RGB : JCS_YCbCr);
     jpeg_set_quality(&c, 90, TRUE);
-    c.comp_info[0].h_samp_factor = spec.components == 1 ? 1 : spec.h;
-    c.comp_info[0].v_samp_factor = spec.components == 1 ? 1 : spec.v;
-    c.restart_interval = static_cast<unsigned>(spec.restartInterval);
-    c.image_height = spec.rowsPerStrip;  // for the tables; each strip sets its own
+    c.comp_info[0].h_samp_factor = layout.components == 1 ? 1 : layout.h;
+    c.comp_info[0].v_samp_factor = layout.components == 1 ? 1 : layout.v;
+    c.restart_interval = static_cast<unsigned>(layout.restartInterval);
+    c.image_height = layout.rowsPerStrip;  // for the tables; each strip sets its own
     unsigned char* memory = nullptr;
     unsigned long size = 0;
     Bytes tables;
-    if (spec.tables) {
+    if (layout.tables) {
         jpeg_mem_dest(&c, &memory, &size);
         jpeg_write_tables(&c);
         tables = TakeMemory(memory, size);
     }
     std::vector<Bytes> strips;
-    for (uint32_t top = 0; top < spec.height; top += spec.rowsPerStrip) {
-        const uint32_t rows = std::min(spec.rowsPerStrip, spec.height - top);
+    for (uint32_t top = 0; top < layout.height; top += layout.rowsPerStrip) {
+        const uint32_t rows = std::min(layout.rowsPerStrip, layout.height - top);
         c.image_height = rows;
         jpeg_mem_dest(&c, &memory, &size);
-        jpeg_start_compress(&c, spec.tables && !spec.wholeStrips ? FALSE : TRUE);
-        Bytes row(static_cast<size_t>(spec.width) * spec.components);
+        jpeg_start_compress(&c, layout.tables && !layout.wholeStrips ? FALSE : TRUE);
+        Bytes row(static_cast<size_t>(layout.width) * layout.components);
         for (uint32_t y = top; y < top + rows; ++y) {
-            for (uint32_t x = 0; x < spec.width; ++x)
-                for (int k = 0; k < spec.components; ++k) row[x * spec.components + k] = JpegSourceSample(x, y, k);
+            for (uint32_t x = 0; x < layout.width; ++x)
+                for (int k = 0; k < layout.components; ++k) row[x * layout.components + k] = JpegSourceSample(x, y, k);
             JSAMPROW pointer = row.data();
             jpeg_write_scanlines(&c, &pointer, 1);
         }
@@ -74,15 +74,15 @@ Bytes MakeJpegTiff(const JpegPageSpec& spec) {
 
     TempFile file;
     TIFF* tif = TIFFOpen(file.c_str(), "w");
-    TIFFSetField(tif, TIFFTAG_IMAGEWIDTH, spec.width);
-    TIFFSetField(tif, TIFFTAG_IMAGELENGTH, spec.height);
+    TIFFSetField(tif, TIFFTAG_IMAGEWIDTH, layout.width);
+    TIFFSetField(tif, TIFFTAG_IMAGELENGTH, layout.height);
     TIFFSetField(tif, TIFFTAG_BITSPERSAMPLE, 8);
-    TIFFSetField(tif, TIFFTAG_SAMPLESPERPIXEL, spec.components);
+    TIFFSetField(tif, TIFFTAG_SAMPLESPERPIXEL, layout.components);
     TIFFSetField(tif, TIFFTAG_COMPRESSION, COMPRESSION_JPEG);
     TIFFSetField(tif, TIFFTAG_PHOTOMETRIC,
-                 spec.components == 1 ? PHOTOMETRIC_MINISBLACK : spec.rgb ? PHOTOMETRIC_RGB : PHOTOMETRIC_YCBCR);
-    if (spec.components == 3 && !spec.rgb) TIFFSetField(tif, TIFFTAG_YCBCRSUBSAMPLING, spec.h, spec.v);
-    TIFFSetField(tif, TIFFTAG_ROWSPERSTRIP, spec.rowsPerStrip);
+                 layout.components == 1 ? PHOTOMETRIC_MINISBLACK : layout.rgb ? PHOTOMETRIC_RGB : PHOTOMETRIC_YCBCR);
+    if (layout.components == 3 && !layout.rgb) TIFFSetField(tif, TIFFTAG_YCBCRSUBSAMPLING, layout.h, layout.v);
+    TIFFSetField(tif, TIFFTAG_ROWSPERSTRIP, layout.rowsPerStrip);
     if (!tables.empty()) TIFFSetField(tif, TIFFTAG_JPEGTABLES, static_cast<uint32_t>(tables.size()), tables.data());
     for (uint32_t s = 0; s < strips.size(); ++s)
         TIFFWriteRawStrip(tif, s, strips[s].data(), static_cast<tmsize_t>(strips[s].size()));
@@ -90,8 +90,8 @@ Bytes MakeJpegTiff(const JpegPageSpec& spec) {
     return ReadFileBytes(file.path());
 }
 
-Bytes MakeJpeg(const JpegStreamSpec& spec) {
-    const JpegPageSpec& page = spec.page;
+Bytes MakeJpeg(const JpegStreamLayout& layout) {
+    const JpegPageLayout& page = layout.page;
     jpeg_compress_struct c{};
     jpeg_error_mgr errors{};
     c.err = jpeg_std_error(&errors);
@@ -106,15 +106,15 @@ Bytes MakeJpeg(const JpegStreamSpec& spec) {
     c.comp_info[0].h_samp_factor = page.h;
     c.comp_info[0].v_samp_factor = page.v;
     if (page.components >= 3) {
-        c.comp_info[1].h_samp_factor = spec.cbH;
-        c.comp_info[1].v_samp_factor = spec.cbV;
-        c.comp_info[2].h_samp_factor = spec.crH;
-        c.comp_info[2].v_samp_factor = spec.crV;
+        c.comp_info[1].h_samp_factor = layout.cbH;
+        c.comp_info[1].v_samp_factor = layout.cbV;
+        c.comp_info[2].h_samp_factor = layout.crH;
+        c.comp_info[2].v_samp_factor = layout.crV;
     }
-    if (spec.densityUnit) {
+    if (layout.densityUnit) {
         c.write_JFIF_header = TRUE;
-        c.density_unit = static_cast<UINT8>(spec.densityUnit);
-        c.X_density = c.Y_density = static_cast<UINT16>(spec.density);
+        c.density_unit = static_cast<UINT8>(layout.densityUnit);
+        c.X_density = c.Y_density = static_cast<UINT16>(layout.density);
     }
     unsigned char* memory = nullptr;
     unsigned long size = 0;

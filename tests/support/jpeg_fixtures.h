@@ -9,7 +9,7 @@
 
 namespace zantest {
 
-struct JpegPageSpec {
+struct JpegPageLayout {
     uint32_t width = 64;
     uint32_t height = 48;
     uint32_t rowsPerStrip = 16;
@@ -24,18 +24,18 @@ struct JpegPageSpec {
 // The page's pixels: a gradient with some texture.
 uint8_t JpegSourceSample(uint32_t x, uint32_t y, int component);
 
-// One-page TIFF laid out as `spec` describes, its strips JPEG streams.
-Bytes MakeJpegTiff(const JpegPageSpec& spec);
+// One-page TIFF laid out as `layout` describes, its strips JPEG streams.
+Bytes MakeJpegTiff(const JpegPageLayout& layout);
 
 // One whole JPEG stream of the page `page` describes (its strips ignored): components
 // 1 grey, 3 YCbCr (or RGB), 4 CMYK; `cbH`/`cbV` and `crH`/`crV` the chroma
 // sampling; a JFIF density of `density` (unit `densityUnit`: 1 inch, 2 cm).
-struct JpegStreamSpec {
-    JpegPageSpec page;
+struct JpegStreamLayout {
+    JpegPageLayout page;
     int cbH = 1, cbV = 1, crH = 1, crV = 1;
     int density = 0, densityUnit = 0;
 };
-Bytes MakeJpeg(const JpegStreamSpec& spec);
+Bytes MakeJpeg(const JpegStreamLayout& layout);
 
 // Rewrites the sampling factors of `component` in the stream's frame header:
 // layouts libjpeg's encoder refuses to make (fractional ones) but whose

@@ -48,7 +48,7 @@ void PackRow(uint8_t* out, size_t outSize, const std::vector<uint32_t>& samples,
     }
 }
 
-std::vector<uint32_t> RowSamples(const PageSpec& p, uint32_t page, uint32_t y, int plane) {
+std::vector<uint32_t> RowSamples(const PageLayout& p, uint32_t page, uint32_t y, int plane) {
     std::vector<uint32_t> samples;
     for (uint32_t x = 0; x < p.width; ++x) {
         if (plane >= 0) {
@@ -61,7 +61,7 @@ std::vector<uint32_t> RowSamples(const PageSpec& p, uint32_t page, uint32_t y, i
     return samples;
 }
 
-bool SetPageTags(TIFF* tif, const PageSpec& p) {
+bool SetPageTags(TIFF* tif, const PageLayout& p) {
     bool ok = TIFFSetField(tif, TIFFTAG_IMAGEWIDTH, p.width) &&
               TIFFSetField(tif, TIFFTAG_IMAGELENGTH, p.height) &&
               TIFFSetField(tif, TIFFTAG_SAMPLESPERPIXEL, p.samplesPerPixel) &&
@@ -101,7 +101,7 @@ bool SetPageTags(TIFF* tif, const PageSpec& p) {
     return ok;
 }
 
-bool WriteTiles(TIFF* tif, const PageSpec& p, uint32_t page) {
+bool WriteTiles(TIFF* tif, const PageLayout& p, uint32_t page) {
     const int planes = p.planar == PLANARCONFIG_SEPARATE ? p.samplesPerPixel : 1;
     std::vector<uint8_t> tile(static_cast<size_t>(TIFFTileSize(tif)));
     const uint32_t perPixel = planes > 1 ? 1 : p.samplesPerPixel;
@@ -133,7 +133,7 @@ bool WriteTiles(TIFF* tif, const PageSpec& p, uint32_t page) {
     return true;
 }
 
-bool WriteScanlines(TIFF* tif, const PageSpec& p, uint32_t page) {
+bool WriteScanlines(TIFF* tif, const PageLayout& p, uint32_t page) {
     const int planes = p.planar == PLANARCONFIG_SEPARATE ? p.samplesPerPixel : 1;
     std::vector<uint8_t> row(static_cast<size_t>(TIFFScanlineSize(tif)));
     for (int plane = 0; plane < planes; ++plane)
@@ -147,9 +147,9 @@ bool WriteScanlines(TIFF* tif, const PageSpec& p, uint32_t page) {
 
 }  // namespace
 
-bool WritePages(TIFF* tif, const FileSpec& spec, uint32_t firstPageIndex) {
-    for (size_t i = 0; i < spec.pages.size(); ++i) {
-        const PageSpec& p = spec.pages[i];
+bool WritePages(TIFF* tif, const FileLayout& layout, uint32_t firstPageIndex) {
+    for (size_t i = 0; i < layout.pages.size(); ++i) {
+        const PageLayout& p = layout.pages[i];
         const auto page = static_cast<uint32_t>(firstPageIndex + i);
         if (!SetPageTags(tif, p)) return false;
         if (!(p.tileWidth ? WriteTiles(tif, p, page) : WriteScanlines(tif, p, page))) return false;
@@ -182,33 +182,33 @@ Bytes MakeExifTiff() {
     TempFile file;
     TIFF* tif = TIFFOpen(file.c_str(), "w");
     if (!tif) throw std::runtime_error("libtiff cannot create a file");
-    const bool ok = WriteExifForNextPage(tif, FillTypicalExif) && WritePages(tif, FileSpec{});
+    const bool ok = WriteExifForNextPage(tif, FillTypicalExif) && WritePages(tif, FileLayout{});
     TIFFClose(tif);
     if (!ok) throw std::runtime_error("libtiff refused the EXIF fixture");
     return ReadFileBytes(file.path());
 }
 
-void WriteTiffFile(const std::string& path, const FileSpec& spec) {
+void WriteTiffFile(const std::string& path, const FileLayout& layout) {
     std::string mode = "w";
-    mode += spec.bigEndian ? "b" : "l";
-    if (spec.bigTiff) mode += "8";
+    mode += layout.bigEndian ? "b" : "l";
+    if (layout.bigTiff) mode += "8";
     TIFF* tif = TIFFOpen(path.c_str(), mode.c_str());
     if (!tif) throw std::runtime_error("libtiff cannot create " + path);
-    const bool ok = WritePages(tif, spec);
+    const bool ok = WritePages(tif, layout);
     TIFFClose(tif);
     if (!ok) throw std::runtime_error("libtiff refused a fixture page");
 }
 
-Bytes MakeTiff(const FileSpec& spec) {
+Bytes MakeTiff(const FileLayout& layout) {
     TempFile file;
-    WriteTiffFile(file.path(), spec);
+    WriteTiffFile(file.path(), layout);
     return ReadFileBytes(file.path());
 }
 
 Bytes MakePages(int pages) {
-    FileSpec spec;
-    spec.pages.assign(static_cast<size_t>(pages), PageSpec{});
-    return MakeTiff(spec);
+    FileLayout layout;
+    layout.pages.assign(static_cast<size_t>(pages), PageLayout{});
+    return MakeTiff(layout);
 }
 
 Bytes ReadFileBytes(const std::string& path) {

@@ -26,7 +26,7 @@ private:
 };
 
 // What a fixture page looks like. Pixels follow PixelValue().
-struct PageSpec {
+struct PageLayout {
     uint32_t width = 16;
     uint32_t height = 8;
     uint16_t samplesPerPixel = 1;
@@ -50,8 +50,8 @@ struct PageSpec {
     uint16_t orientation = 0;            // Orientation when nonzero
 };
 
-struct FileSpec {
-    std::vector<PageSpec> pages{PageSpec{}};
+struct FileLayout {
+    std::vector<PageLayout> pages{PageLayout{}};
     bool bigEndian = false;
     bool bigTiff = false;
 };
@@ -72,15 +72,15 @@ void FillTypicalExif(TIFF* tif);
 Bytes MakeExifTiff();
 
 // Writes the file with libtiff to `path`.
-void WriteTiffFile(const std::string& path, const FileSpec& spec);
+void WriteTiffFile(const std::string& path, const FileLayout& layout);
 // The same file as bytes.
-Bytes MakeTiff(const FileSpec& spec);
-// A file of `pages` pages of the default page spec.
+Bytes MakeTiff(const FileLayout& layout);
+// A file of `pages` pages of the default page layout.
 Bytes MakePages(int pages);
 
-// Writes the pages of `spec` into an open codec object (tags, pixels,
+// Writes the pages of `layout` into an open codec object (tags, pixels,
 // TIFFWriteDirectory for each page). False when libtiff refuses any step.
-bool WritePages(TIFF* tif, const FileSpec& spec, uint32_t firstPageIndex = 0);
+bool WritePages(TIFF* tif, const FileLayout& layout, uint32_t firstPageIndex = 0);
 
 Bytes ReadFileBytes(const std::string& path);
 void WriteFileBytes(const std::string& path, const Bytes& bytes);

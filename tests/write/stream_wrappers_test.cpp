@@ -88,8 +88,8 @@ std::pair<Bytes, Bytes> StripAndPixels(const Bytes& tiff) {
 }
 
 // A stream of 50 x 35 pixels: not a whole number of MCUs.
-JpegStreamSpec Stream(int components, int h, int v, bool rgb = false) {
-    JpegStreamSpec stream;
+JpegStreamLayout Stream(int components, int h, int v, bool rgb = false) {
+    JpegStreamLayout stream;
     stream.page = {.width = 50, .height = 35, .components = components, .h = h, .v = v, .rgb = rgb};
     return stream;
 }
@@ -97,13 +97,13 @@ JpegStreamSpec Stream(int components, int h, int v, bool rgb = false) {
 TEST(JpegWrap, PagesDecodeToTheStreamsOwnPixels) {
     // From every source kind the stream is the strip, unchanged, under tags
     // of the stream's own layout and density.
-    JpegStreamSpec dense = Stream(3, 2, 2);
+    JpegStreamLayout dense = Stream(3, 2, 2);
     dense.density = 118;  // dots a centimetre
     dense.densityUnit = 2;
     const std::string ycbcr = "Photometric Interpretation: YCbCr";
     const struct Case {
         const char* what;
-        JpegStreamSpec stream;
+        JpegStreamLayout stream;
         std::vector<std::string> lines, absent;
     } cases[] = {
         {"4:2:0", dense, {ycbcr, "YCbCr Subsampling: 2, 2", "Resolution: 299.72, 299.72 pixels/inch"}, {}},
@@ -133,7 +133,7 @@ TEST(JpegWrap, PagesDecodeToTheStreamsOwnPixels) {
 TEST(StreamWraps, CallsThatGiveNoPageSayWhy) {
     // Streams a page cannot hold as they are are declined with a trace (no
     // direct conversion); unusable sources and destinations are refused.
-    JpegStreamSpec unequal = Stream(3, 2, 2), chroma = Stream(3, 2, 2);
+    JpegStreamLayout unequal = Stream(3, 2, 2), chroma = Stream(3, 2, 2);
     unequal.crH = 2;
     chroma.cbH = chroma.crH = 2;  // libtiff reads chroma of 1 x 1 only
     Bytes remainder = MakeJpeg(Stream(3, 3, 1));  // Y 3 x 1 over chroma 2 x 1
@@ -207,8 +207,8 @@ TEST(JpegWrap, TheHandedOverImageIsTheHostsAlone) {
 // The raw Group 4 strip of a one-strip min-is-white page of 70 x 30 written
 // by libtiff, and that page's pixels.
 std::pair<Bytes, Bytes> G4Stream() {
-    FileSpec file;
-    PageSpec& p = file.pages[0];
+    FileLayout file;
+    PageLayout& p = file.pages[0];
     p.width = 70;
     p.height = p.rowsPerStrip = 30;
     p.bitsPerSample = 1;

@@ -17,8 +17,8 @@ protected:
     // Two pages, the first one uncompressed strip of 16 KiB (libtiff opens it
     // for update as several strips and writes that layout back).
     void SetUp() override {
-        FileSpec pages;
-        pages.pages.assign(2, PageSpec{});
+        FileLayout pages;
+        pages.pages.assign(2, PageLayout{});
         pages.pages[0].description = "original";
         pages.pages[0].width = 512;
         pages.pages[0].height = pages.pages[0].rowsPerStrip = 32;

@@ -78,19 +78,8 @@ private:
         return 0;
     }
 
-    // The end of every call: codec object, handlers, stream buffer and file
-    // record go, and the job is idle.
-    void End() {
-        if (ctx_->state == ZAN_STATE_READING) ReleaseReaderBuffers(ctx_);
-        if (ctx_->tiff) {
-            TIFFClose(ctx_->tiff);
-            ctx_->tiff = nullptr;
-        }
-        RestoreCodecMessages(ctx_);
-        CloseStreamBuffer(ctx_);
-        ReleaseFileHandle(ctx_);
-        ctx_->state = ZAN_STATE_IDLE;
-    }
+    // The end of every call: the job holds nothing and is idle.
+    void End() { EndReadJob(ctx_); }
 
     int Decode(uint32_t* direct) {
         zanResetFrameBuffer(ctx_);
@@ -208,9 +197,10 @@ private:
             TIFFImageEnd(tif_, &image);
             return 0;
         }
-        // 16-bit samples are delivered as 8 unless 16 bits are asked for.
+        // The image reader has chosen the copying put routine of the page's
+        // planar layout; 16-bit samples are delivered as 8 unless 16 bits are
+        // asked for.
         image.reduceTo8 = page_.bits == 16 && ctx_->outputBitsPerSample != 16;
-        image.put = page_.planar == PLANARCONFIG_CONTIG ? putcontigcopy : putstripsepcopy;
         const bool separate = page_.planar != PLANARCONFIG_CONTIG;
         const uint64_t rowBytes = image.reduceTo8 ? image.storedRowBytes / 2 : image.storedRowBytes;
         const uint16_t planes = separate ? page_.samples : 1;
@@ -384,10 +374,7 @@ extern "C" ZAN_API int zanTIFFToFrameBuffer(ConversionContext* ctx, uint32_t* di
     using namespace zan;
     if (!ctx) return 0;
     // The codec object of a job that writes pages is no page to decode.
-    if (ctx->state == ZAN_STATE_WRITING || ctx->state == ZAN_STATE_PAGE_CLOSED) {
-        zanError(ctx, "Can not read while writing.");
-        return 0;
-    }
+    if (RefuseWhileWriting(ctx)) return 0;
     uint32_t unused = 0;
     FrameDecode decode(ctx);
     return decode.Run(directConversion ? directConversion : &unused);

@@ -118,15 +118,7 @@ bool CopyIccProfile(ConversionContext* ctx, TIFF* tif) {
 // being read, the codec object and the source go, and the job is idle, so
 // that no later call works with what was closed.
 int CloseFailedJob(ConversionContext* ctx) {
-    if (ctx->state == ZAN_STATE_READING) ReleaseReaderBuffers(ctx);
-    ctx->state = ZAN_STATE_IDLE;
-    RestoreCodecMessages(ctx);
-    if (ctx->tiff) {
-        TIFFClose(ctx->tiff);
-        ctx->tiff = nullptr;
-    }
-    ReleaseFileHandle(ctx);
-    CloseStreamBuffer(ctx);
+    EndReadJob(ctx);
     return 0;
 }
 
@@ -203,10 +195,7 @@ extern "C" ZAN_API int zanTIFFGetInfo(ConversionContext* ctx) {
     using namespace zan;
     if (!ctx) return 0;
     // The codec object of a job that writes pages is no page to describe.
-    if (ctx->state == ZAN_STATE_WRITING || ctx->state == ZAN_STATE_PAGE_CLOSED) {
-        zanError(ctx, "Can not read while writing.");
-        return 0;
-    }
+    if (RefuseWhileWriting(ctx)) return 0;
     zanResetFrameBuffer(ctx);
     if (!OpenTIFFForReading(ctx)) return 0;
     TIFF* tif = ctx->tiff;

@@ -42,6 +42,24 @@ void ReleaseReaderBuffers(ConversionContext* ctx) {
     ctx->paletteGreen = ctx->paletteBlue = nullptr;
 }
 
+void EndReadJob(ConversionContext* ctx) {
+    if (ctx->state == ZAN_STATE_READING) ReleaseReaderBuffers(ctx);
+    if (ctx->tiff) {
+        TIFFClose(ctx->tiff);
+        ctx->tiff = nullptr;
+    }
+    RestoreCodecMessages(ctx);
+    CloseStreamBuffer(ctx);
+    ReleaseFileHandle(ctx);
+    ctx->state = ZAN_STATE_IDLE;
+}
+
+bool RefuseWhileWriting(ConversionContext* ctx) {
+    if (ctx->state != ZAN_STATE_WRITING && ctx->state != ZAN_STATE_PAGE_CLOSED) return false;
+    zanError(ctx, "Can not read while writing.");
+    return true;
+}
+
 namespace {
 
 constexpr char kMemoryError[] = "Memory allocation error.";

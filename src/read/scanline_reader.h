@@ -13,6 +13,15 @@ namespace zan {
 // and its palette copy.
 void ReleaseReaderBuffers(ConversionContext* ctx);
 
+// Ends a reading job: the reader's buffers of a page being read, the codec
+// object, the routing of the codec's messages, the stream buffer and the
+// file record go, and the job is idle.
+void EndReadJob(ConversionContext* ctx);
+
+// True, after reporting it, when the job writes pages: its codec object is
+// no page to read.
+bool RefuseWhileWriting(ConversionContext* ctx);
+
 // Chooses the conversions of the selected page and obtains the buffers they
 // need (opening the source first unless a page was described); the job's
 // state becomes reading. 1, or 0 after a reported failure.

@@ -121,19 +121,23 @@ int DescribeStreamPage(ConversionContext* ctx, TIFFStreamDecoder* decoder) {
 // ---- bands ----
 
 // The ink values of a separated band spread from the dot range to 0..255.
+// The result depends on the byte alone: worked out once for each of the 256
+// values, then looked up.
 void StretchDotRange(const ConversionContext* ctx, uint8_t* band, uint64_t bytes) {
     const int span = int{ctx->dotRangeHigh} - int{ctx->dotRangeLow};
     const float low = ctx->dotRangeLow;
-    for (uint64_t i = 0; i < bytes; ++i) {
+    uint8_t stretched[256];
+    for (int value = 0; value < 256; ++value) {
         float v = 0;
         if (span == 0) {
-            v = band[i] > low ? 255.0f : 0.0f;  // equal bounds: a threshold
+            v = static_cast<float>(value) > low ? 255.0f : 0.0f;  // equal bounds: a threshold
         } else {
             const auto factor = static_cast<float>(255.0 / span);
-            v = (static_cast<float>(band[i]) - low) * factor;
+            v = (static_cast<float>(value) - low) * factor;
         }
-        band[i] = static_cast<uint8_t>(std::clamp(v, 0.0f, 255.0f));
+        stretched[value] = static_cast<uint8_t>(std::clamp(v, 0.0f, 255.0f));
     }
+    for (uint64_t i = 0; i < bytes; ++i) band[i] = stretched[band[i]];
 }
 
 int HandOverBand(ConversionContext* ctx, TIFFStreamDecoder* decoder, StreamChunk* chunk) {
@@ -186,10 +190,7 @@ using namespace zan;
 extern "C" ZAN_API int zanTIFFStreamDecodeInit(ConversionContext* ctx, void* hostValue) {
     if (!ctx) return 0;
     // The rows of bands come from the job's reader: not while it writes.
-    if (ctx->state == ZAN_STATE_WRITING || ctx->state == ZAN_STATE_PAGE_CLOSED) {
-        zanError(ctx, "Can not read while writing.");
-        return 0;
-    }
+    if (RefuseWhileWriting(ctx)) return 0;
     // A decoder of an earlier stream of the job is not left behind.
     EndDecoder(ctx);
     RedirectCodecMessages(ctx);

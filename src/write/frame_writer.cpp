@@ -37,13 +37,8 @@ int FailWrite(ConversionContext* ctx) {
 }
 
 void SetPageTags(ConversionContext* ctx, TIFF* tif, const ColourLayout& layout) {
-    TIFFSetField(tif, TIFFTAG_SUBFILETYPE, 0);
-    TIFFSetField(tif, TIFFTAG_IMAGEWIDTH, ctx->frameWidth);
-    TIFFSetField(tif, TIFFTAG_IMAGELENGTH, ctx->frameHeight);
-    TIFFSetField(tif, TIFFTAG_ORIENTATION, ctx->outputOrientation ? ctx->outputOrientation : ORIENTATION_TOPLEFT);
-    TIFFSetField(tif, TIFFTAG_PLANARCONFIG, PLANARCONFIG_CONTIG);
+    SetWholePageTags(ctx, tif, ctx->frameWidth, ctx->frameHeight);
     TIFFSetField(tif, TIFFTAG_SOFTWARE, TIFFGetVersionLinePivlo());
-    TIFFSetField(tif, TIFFTAG_FILLORDER, FILLORDER_MSB2LSB);
     const bool bilevel = ctx->colorSpace == ZAN_COLORSPACE_BILEVEL;
     SetColourTags(tif, layout);
     TIFFSetField(tif, TIFFTAG_COMPRESSION, bilevel ? COMPRESSION_CCITTFAX4 : COMPRESSION_PACKBITS);

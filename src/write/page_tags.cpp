@@ -36,11 +36,25 @@ void SetColourTags(TIFF* tif, const ColourLayout& layout) {
     }
 }
 
-void SetResolution(ConversionContext* ctx, TIFF* tif) {
+void SetWholePageTags(ConversionContext* ctx, TIFF* tif, uint32_t width, uint32_t height) {
+    TIFFSetField(tif, TIFFTAG_SUBFILETYPE, 0);
+    TIFFSetField(tif, TIFFTAG_IMAGEWIDTH, width);
+    TIFFSetField(tif, TIFFTAG_IMAGELENGTH, height);
+    TIFFSetField(tif, TIFFTAG_ORIENTATION, ctx->outputOrientation ? ctx->outputOrientation : ORIENTATION_TOPLEFT);
+    TIFFSetField(tif, TIFFTAG_PLANARCONFIG, PLANARCONFIG_CONTIG);
+    TIFFSetField(tif, TIFFTAG_FILLORDER, FILLORDER_MSB2LSB);
+}
+
+void SetResolution(ConversionContext* ctx, TIFF* tif, float fallbackX, float fallbackY) {
     TIFFSetField(tif, TIFFTAG_RESOLUTIONUNIT, RESUNIT_INCH);
-    if (ctx->outputXResolution > 0 && ctx->outputYResolution > 0) {
-        TIFFSetField(tif, TIFFTAG_XRESOLUTION, static_cast<double>(ctx->outputXResolution));
-        TIFFSetField(tif, TIFFTAG_YRESOLUTION, static_cast<double>(ctx->outputYResolution));
+    float x = ctx->outputXResolution, y = ctx->outputYResolution;
+    if (!(x > 0 && y > 0)) {
+        x = fallbackX;
+        y = fallbackY;
+    }
+    if (x > 0 && y > 0) {
+        TIFFSetField(tif, TIFFTAG_XRESOLUTION, static_cast<double>(x));
+        TIFFSetField(tif, TIFFTAG_YRESOLUTION, static_cast<double>(y));
     }
 }
 

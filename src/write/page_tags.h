@@ -28,8 +28,14 @@ bool ColourLayoutFor(uint32_t colorSpace, uint32_t width, bool sixteen, bool whi
 // ExtraSamples, in that order.
 void SetColourTags(TIFF* tif, const ColourLayout& layout);
 
-// ResolutionUnit inch always; the resolutions when both are above 0.
-void SetResolution(ConversionContext* ctx, TIFF* tif);
+// The tags every written page starts with: a full-resolution page of
+// `width` x `height`, the orientation asked for (top-left by default),
+// contiguous samples, bits in their natural order.
+void SetWholePageTags(ConversionContext* ctx, TIFF* tif, uint32_t width, uint32_t height);
+
+// ResolutionUnit inch always; the resolutions asked for when both are above
+// 0, else `fallbackX` and `fallbackY` when both are above 0.
+void SetResolution(ConversionContext* ctx, TIFF* tif, float fallbackX = 0, float fallbackY = 0);
 
 // The ICC profile, when the context has one.
 void SetIccProfile(ConversionContext* ctx, TIFF* tif);

@@ -181,17 +181,6 @@ uint64_t FirstBlock(const StreamSource& source, uint64_t guess) {
     return std::clamp<uint64_t>(expected ? expected + 1024 : guess, 60, kLargestFirstBlock);
 }
 
-// The tags both wrappers start with, in their order: a full-resolution page
-// of the image's size, contiguous, bits in their natural order.
-void SetPageFrameTags(ConversionContext* ctx, TIFF* tif) {
-    TIFFSetField(tif, TIFFTAG_SUBFILETYPE, 0);
-    TIFFSetField(tif, TIFFTAG_IMAGEWIDTH, ctx->imageWidth);
-    TIFFSetField(tif, TIFFTAG_IMAGELENGTH, ctx->imageHeight);
-    TIFFSetField(tif, TIFFTAG_ORIENTATION, ctx->outputOrientation ? ctx->outputOrientation : ORIENTATION_TOPLEFT);
-    TIFFSetField(tif, TIFFTAG_PLANARCONFIG, PLANARCONFIG_CONTIG);
-    TIFFSetField(tif, TIFFTAG_FILLORDER, FILLORDER_MSB2LSB);
-}
-
 // ---- JPEG ----
 
 // Whether the JPEG can be a TIFF page as it is; the reason when it cannot.
@@ -217,7 +206,7 @@ const char* JpegUnfit(const ConversionContext* ctx, bool* rgb) {
 
 void SetJpegTags(ConversionContext* ctx, TIFF* tif, bool rgb) {
     const bool colour = ctx->componentCount == 3;
-    SetPageFrameTags(ctx, tif);
+    SetWholePageTags(ctx, tif, ctx->imageWidth, ctx->imageHeight);
     TIFFSetField(tif, TIFFTAG_BITSPERSAMPLE, 8);
     TIFFSetField(tif, TIFFTAG_COMPRESSION, COMPRESSION_JPEG);
     TIFFSetField(tif, TIFFTAG_SAMPLESPERPIXEL, colour ? 3 : 1);
@@ -227,17 +216,8 @@ void SetJpegTags(ConversionContext* ctx, TIFF* tif, bool rgb) {
         TIFFSetField(tif, TIFFTAG_YCBCRSUBSAMPLING, ctx->horizontalSampling[0] / ctx->horizontalSampling[1],
                      ctx->verticalSampling[0] / ctx->verticalSampling[1]);
     TIFFSetField(tif, TIFFTAG_ROWSPERSTRIP, ctx->imageHeight);
-    TIFFSetField(tif, TIFFTAG_RESOLUTIONUNIT, RESUNIT_INCH);
     // The resolution asked for, else the stream's own.
-    float x = ctx->outputXResolution, y = ctx->outputYResolution;
-    if (!(x > 0 && y > 0)) {
-        x = ctx->xResolution;
-        y = ctx->yResolution;
-    }
-    if (x > 0 && y > 0) {
-        TIFFSetField(tif, TIFFTAG_XRESOLUTION, static_cast<double>(x));
-        TIFFSetField(tif, TIFFTAG_YRESOLUTION, static_cast<double>(y));
-    }
+    SetResolution(ctx, tif, ctx->xResolution, ctx->yResolution);
 }
 
 int WrapJpeg(ConversionContext* ctx, uint32_t* directConversion) {
@@ -263,7 +243,7 @@ int WrapJpeg(ConversionContext* ctx, uint32_t* directConversion) {
 // ---- Group 4 ----
 
 void SetG4Tags(ConversionContext* ctx, TIFF* tif) {
-    SetPageFrameTags(ctx, tif);
+    SetWholePageTags(ctx, tif, ctx->imageWidth, ctx->imageHeight);
     TIFFSetField(tif, TIFFTAG_BITSPERSAMPLE, 1);
     TIFFSetField(tif, TIFFTAG_SAMPLESPERPIXEL, 1);
     TIFFSetField(tif, TIFFTAG_PHOTOMETRIC, ctx->whiteIsZero ? PHOTOMETRIC_MINISWHITE : PHOTOMETRIC_MINISBLACK);

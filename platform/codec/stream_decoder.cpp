@@ -138,6 +138,13 @@ uint32_t SizeHeld(void* client) {
 
 // ---- the page ----
 
+// Rows of `rowBytes` bytes in a band: as many as fit in kBandBytes, at least
+// one, at most the page's `height`.
+uint32_t BandRowsFor(uint64_t rowBytes, uint32_t height) {
+    const auto rows = static_cast<uint32_t>(std::max<uint64_t>(1, kBandBytes / rowBytes));
+    return std::min(rows, std::max<uint32_t>(height, 1));
+}
+
 uint32_t ColourSpaceOf(TIFF* tif) {
     uint16_t photometric = PHOTOMETRIC_RGB, bits = 1, samples = 1, extra = 0;
     const uint16_t* kinds = nullptr;
@@ -297,8 +304,7 @@ bool BeginRows(Decoder* d) {
         TIFFErrorExt(nullptr, kModule, "A row of the page is larger than 1 GiB.");
         return false;
     }
-    d->bandRows = static_cast<uint32_t>(std::max<uint64_t>(1, kBandBytes / d->rowBytes));
-    d->bandRows = std::min(d->bandRows, std::max<uint32_t>(d->layout.height, 1));
+    d->bandRows = BandRowsFor(d->rowBytes, d->layout.height);
     d->band = static_cast<uint8_t*>(Allocate(d, uint64_t{d->bandRows - 1} * d->rowBytes + d->rowWritten));
     if (!d->band) {
         TIFFErrorExt(nullptr, kModule, "Out of memory for a band of rows.");
@@ -435,8 +441,7 @@ int DeliverBypassRows(Decoder* d) {
             const uint64_t rowBytes = d->jpeg->rowBytes();
             if (rowBytes == 0 || rowBytes > kHeldInputLimit) return Fail(d, "The JPEG's rows are too long.");
             d->rowBytes = static_cast<uint32_t>(rowBytes);
-            d->bandRows = static_cast<uint32_t>(std::max<uint64_t>(1, kBandBytes / rowBytes));
-            d->bandRows = std::min(d->bandRows, std::max<uint32_t>(d->jpeg->height(), 1));
+            d->bandRows = BandRowsFor(rowBytes, d->jpeg->height());
             d->band = static_cast<uint8_t*>(Allocate(d, uint64_t{d->bandRows} * rowBytes));
             if (!d->band) return Fail(d, "Out of memory for a band of rows.");
             continue;

@@ -134,6 +134,16 @@ enum RowSource : uint32_t { kScanlines = 0, kBlocks = 1, kRgbaBands = 2 };
 
 constexpr char kLineTooLong[] = "A line of the page is larger than 4 GiB.";
 
+// The rows of a block: a tile's length or the page's RowsPerStrip. Returns
+// the message of a failure, or null.
+const char* BlockRows(TIFF* tif, uint32_t* rows) {
+    if (!TIFFIsTiled(tif)) {
+        TIFFGetFieldDefaulted(tif, TIFFTAG_ROWSPERSTRIP, rows);
+        return nullptr;
+    }
+    return TIFFGetField(tif, TIFFTAG_TILELENGTH, rows) && *rows != 0 ? nullptr : "Error getting tileheight field.";
+}
+
 // Rows of a JPEG page come out of strips decoded in RGB, and rows of a tiled
 // page out of a band of tiles (one row of tiles, all planes) assembled in
 // the strip buffer; a tiled page's buffer also holds one tile after the band.
@@ -148,16 +158,14 @@ const char* SetUpBlockReading(ConversionContext* ctx, TIFF* tif, bool jpeg, uint
     }
     const bool tiled = TIFFIsTiled(tif);
     uint32_t bandRows = 0;
+    if (const char* failure = BlockRows(tif, &bandRows)) return failure;
     uint64_t size = 0;
     if (tiled) {
         const tmsize_t tile = TIFFTileSize(tif);
-        if (!TIFFGetField(tif, TIFFTAG_TILELENGTH, &bandRows) || bandRows == 0)
-            return "Error getting tileheight field.";
         if (tile <= 0) return "Unable to work out the size of a tile.";
         if (!MultiplySizes(*rowBytes, bandRows, &size)) return kLineTooLong;
         size += static_cast<uint64_t>(tile);
     } else {
-        TIFFGetFieldDefaulted(tif, TIFFTAG_ROWSPERSTRIP, &bandRows);
         bandRows = std::max<uint32_t>(1, std::min(bandRows, ctx->imageHeight));
         const tmsize_t strip = TIFFStripSize(tif);
         if (!MultiplySizes(*rowBytes, bandRows, &size)) return kLineTooLong;
@@ -189,12 +197,7 @@ const char* SetUpRgbaBands(ConversionContext* ctx, TIFF* tif) {
     }
     TIFFRGBAImageEnd(&probe);
     uint32_t bandRows = 0;
-    if (TIFFIsTiled(tif)) {
-        if (!TIFFGetField(tif, TIFFTAG_TILELENGTH, &bandRows) || bandRows == 0)
-            return "Error getting tileheight field.";
-    } else {
-        TIFFGetFieldDefaulted(tif, TIFFTAG_ROWSPERSTRIP, &bandRows);
-    }
+    if (const char* failure = BlockRows(tif, &bandRows)) return failure;
     bandRows = std::max<uint32_t>(1, std::min(bandRows, ctx->imageHeight));
     uint64_t raster = 0, line = 0;
     if (!MultiplySizes(ctx->imageWidth, bandRows, 4, &raster) || !FitsIn32(raster) ||

@@ -85,6 +85,15 @@ TIFF* OpenMemoryWithLibtiff(const Bytes& bytes, const char* mode) {
     return tif;
 }
 
+namespace {
+void DropMessage(ConversionContext*, int, int, const char*) {}
+}  // namespace
+
+void InitQuietJob(ConversionContext* ctx) {
+    pivloInitContext(ctx);
+    ctx->hostMessageProc = DropMessage;
+}
+
 void ReadRowsAndRelease(benchmark::State& state, ConversionContext* ctx, Bytes& line, uint32_t rows) {
     for (uint32_t y = 0; y < rows; ++y)
         if (!zanTIFFReadNextScanLine(ctx, line.data(), static_cast<uint32_t>(line.size()))) {

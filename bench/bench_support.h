@@ -26,6 +26,10 @@ std::string WriteTemporary(const Bytes& bytes, const std::string& name);
 // reference the 32-bit module procedures are compared with.
 TIFF* OpenMemoryWithLibtiff(const Bytes& bytes, const char* mode);
 
+// A job record with the C-heap allocators whose host messages go nowhere
+// (a benchmark reports failures through its results).
+void InitQuietJob(ConversionContext* ctx);
+
 // Reads `rows` lines of the job's page into `line` (a failure ends the case
 // with an error), then tears the job down.
 void ReadRowsAndRelease(benchmark::State& state, ConversionContext* ctx, Bytes& line, uint32_t rows);

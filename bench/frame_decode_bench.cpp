@@ -59,8 +59,6 @@ const std::string& InputFile(Kind kind) {
     return paths.emplace(kind, path).first->second;
 }
 
-void Quiet(ConversionContext*, int, int, const char*) {}
-
 // The page's bytes in memory, read once per run.
 const zanbench::Bytes& InputBytes(Kind kind) {
     static std::map<Kind, zanbench::Bytes> bytes;
@@ -83,8 +81,7 @@ void Module(benchmark::State& state, Kind kind, uint32_t destFormat) {
     for (auto _ : state) {
         FILE* fp = destFormat ? nullptr : std::fopen(path.c_str(), "rb");
         ConversionContext ctx;
-        pivloInitContext(&ctx);
-        ctx.hostMessageProc = Quiet;
+        zanbench::InitQuietJob(&ctx);
         if (fp) {
             ctx.sourceKind = ZAN_SOURCE_FILE;
             ctx.sourceFp = fp;

@@ -17,8 +17,6 @@ using zanbench::GeneratedTiff;
 
 const zanbench::Bytes& TwoHundredPages() { return GeneratedTiff(200, 256, 64, COMPRESSION_LZW); }
 
-void Quiet(ConversionContext*, int, int, const char*) {}
-
 int WalkAndDecodeFirstStrips(TIFF* tif) {
     static std::vector<uint8_t> strip(1 << 20);
     int pages = 0;
@@ -33,8 +31,7 @@ void Module_MemorySource(benchmark::State& state) {
     const auto& bytes = TwoHundredPages();
     for (auto _ : state) {
         ConversionContext ctx;
-        pivloInitContext(&ctx);
-        ctx.hostMessageProc = Quiet;
+        zanbench::InitQuietJob(&ctx);
         ctx.sourceKind = ZAN_SOURCE_MEMORY;
         ctx.sourceMemory = bytes.data();
         ctx.sourceMemorySize = static_cast<uint32_t>(bytes.size());
@@ -62,8 +59,7 @@ void Module_FileSource(benchmark::State& state) {
     for (auto _ : state) {
         FILE* fp = std::fopen(path.c_str(), "rb");
         ConversionContext ctx;
-        pivloInitContext(&ctx);
-        ctx.hostMessageProc = Quiet;
+        zanbench::InitQuietJob(&ctx);
         ctx.sourceKind = ZAN_SOURCE_FILE;
         ctx.sourceFp = fp;
         if (!zan::OpenTIFFForReading(&ctx)) state.SkipWithError("open failed");

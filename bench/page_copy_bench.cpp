@@ -27,8 +27,6 @@ const std::string& SourcePath() {
     return path;
 }
 
-void Quiet(ConversionContext*, int, int, const char*) {}
-
 void Module_ExtractEveryPage(benchmark::State& state) {
     SourcePath();  // generated outside the measured loop
     for (auto _ : state) {
@@ -36,8 +34,7 @@ void Module_ExtractEveryPage(benchmark::State& state) {
             FILE* source = std::fopen(SourcePath().c_str(), "rb");
             FILE* dest = std::fopen(kOutput, "w+b");
             ConversionContext ctx;
-            pivloInitContext(&ctx);
-            ctx.hostMessageProc = Quiet;
+            zanbench::InitQuietJob(&ctx);
             ctx.sourceKind = ZAN_SOURCE_FILE;
             ctx.sourceFp = source;
             ctx.destKind = ZAN_DEST_FILE;

@@ -62,16 +62,13 @@ const std::string& InputFile(Kind kind) {
     return paths.emplace(kind, path).first->second;
 }
 
-void Quiet(ConversionContext*, int, int, const char*) {}
-
 void Module(benchmark::State& state, Kind kind) {
     const std::string& path = InputFile(kind);
     std::vector<uint8_t> line(static_cast<size_t>(kSize) * 6);
     for (auto _ : state) {
         FILE* fp = std::fopen(path.c_str(), "rb");
         ConversionContext ctx;
-        pivloInitContext(&ctx);
-        ctx.hostMessageProc = Quiet;
+        zanbench::InitQuietJob(&ctx);
         ctx.sourceKind = ZAN_SOURCE_FILE;
         ctx.sourceFp = fp;
         ctx.outputBitsPerSample = 8;

@@ -11,6 +11,7 @@
 
 #include <tiffio.h>
 
+#include "bench_support.h"
 #include "pivlo/pivlo.h"
 #include "zantiff/zantiff.h"
 
@@ -48,12 +49,9 @@ const std::vector<uint8_t>& Frame(const Case& c) {
     return frame;
 }
 
-void Quiet(ConversionContext*, int, int, const char*) {}
-
 // A context that writes one page to the benchmark's output file.
 void InitFileJob(ConversionContext* ctx) {
-    pivloInitContext(ctx);
-    ctx->hostMessageProc = Quiet;
+    zanbench::InitQuietJob(ctx);
     ctx->destKind = ZAN_DEST_FILE;
     ctx->destPath = kOutput;
     ctx->destFp = std::fopen(kOutput, "wb");

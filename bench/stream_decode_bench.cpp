@@ -129,11 +129,8 @@ const zanbench::Bytes& DirectoryFirstPage() {
     return page;
 }
 
-void Quiet(ConversionContext*, int, int, const char*) {}
-
 void StartJob(ConversionContext* ctx) {
-    pivloInitContext(ctx);
-    ctx->hostMessageProc = Quiet;
+    zanbench::InitQuietJob(ctx);
     ctx->allocProc = TrackedHeap::Alloc;
     ctx->reallocProc = TrackedHeap::Realloc;
     ctx->freeProc = TrackedHeap::Free;

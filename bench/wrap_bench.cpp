@@ -15,6 +15,7 @@
 #include <tiffio.h>
 
 #include "bench_jpeg.h"
+#include "bench_support.h"
 #include "pivlo/pivlo.h"
 #include "zantiff/zantiff.h"
 
@@ -32,8 +33,6 @@ const std::string& InputJpeg() {
     return path;
 }
 
-void Quiet(ConversionContext*, int, int, const char*) {}
-
 // File to file, as the tool's wrap command does it.
 void ModuleWrap(benchmark::State& state) {
     const std::string& path = InputJpeg();
@@ -41,8 +40,7 @@ void ModuleWrap(benchmark::State& state) {
         FILE* in = std::fopen(path.c_str(), "rb");
         FILE* out = std::fopen(kOutput.c_str(), "w+b");
         ConversionContext ctx;
-        pivloInitContext(&ctx);
-        ctx.hostMessageProc = Quiet;
+        zanbench::InitQuietJob(&ctx);
         ctx.sourceKind = ZAN_SOURCE_FILE;
         ctx.sourceFp = in;
         ctx.destKind = ZAN_DEST_FILE;

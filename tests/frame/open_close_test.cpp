@@ -12,6 +12,7 @@
 #include "frame_support.h"
 #include "osttiff/osttiff.h"
 #include "pivlo/pivlo.h"
+#include "support/allocation_sweep.h"
 #include "support/memory_stream.h"
 #include "support/test_host.h"
 #include "support/tiff_fixtures.h"
@@ -445,31 +446,22 @@ TEST(Teardown, ReaderBuffersAreReleasedAndTheMemorySourceIsLeftAlone) {
     }
 }
 
-// Runs `job` with the nth allocation failing, for n = 1, 2, … until a run
-// makes no more than n-1 allocations, which must succeed. Every run must end
-// cleanly: a failure reported, the codec's handlers back, every block of the
-// job released.
+// Runs `job` on a fresh host with each of its allocations failing in turn
+// (FailEachAllocation): a failed run is reported and puts the codec's
+// handlers back.
 void SweepAllocationFailures(const std::function<bool(TestHost&)>& job) {
-    for (int n = 1; n < 200; ++n) {
-        SCOPED_TRACE("allocation " + std::to_string(n));
+    FailEachAllocation([&](int n) {
         HandlerProbe probe;
         bool succeeded = false;
         {
             TestHost host;
-            TestAllocator::Reset();
-            TestAllocator::FailNthCall(n);
+            FailAllocation(n);
             succeeded = job(host);
             if (!succeeded) { EXPECT_FALSE(host.Errors().empty()); }
         }
         EXPECT_TRUE(HandlerProbe::InForce());
-        EXPECT_EQ(TestAllocator::LiveBlocks(), 0u);
-        if (TestAllocator::Calls() < n) {
-            TestAllocator::Reset();
-            EXPECT_TRUE(succeeded) << "a run without a failed allocation must succeed";
-            return;
-        }
-    }
-    ADD_FAILURE() << "the job never got through";
+        return succeeded;
+    });
 }
 
 // Every kind of source delivers every page as libtiff decodes it, with the

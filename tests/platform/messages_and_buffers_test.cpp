@@ -43,24 +43,6 @@ TEST(HostMessages, EverySeverityReachesTheHostSinkOrStandardError) {
     EXPECT_EQ(err.find("dropped"), std::string::npos);
 }
 
-// A fresh record is empty and has heap allocators that never answer a
-// request for nothing, or a shrink to nothing, without a block.
-TEST(HostBuffers, InitialisedRecordIsEmptyWithHeapAllocators) {
-    ConversionContext ctx;
-    std::memset(&ctx, 0x5A, sizeof ctx);
-    pivloInitContext(&ctx);
-    EXPECT_EQ(ctx.state, 0u);
-    EXPECT_EQ(ctx.tiff, nullptr);
-    ASSERT_NE(ctx.allocProc, nullptr);
-    void* block = ctx.allocProc(0);
-    EXPECT_NE(block, nullptr);
-    void* grown = ctx.reallocProc(block, 100);
-    ASSERT_NE(grown, nullptr);
-    void* shrunk = ctx.reallocProc(grown, 0);
-    EXPECT_NE(shrunk, nullptr) << "a shrink to nothing keeps a block";
-    ctx.freeProc(shrunk);
-}
-
 // The work buffer is kept while big enough, grows on demand, keeps the old
 // one when growth is refused, and goes with the reset.
 TEST(HostBuffers, WorkBufferGrowsAndIsReleasedByTheReset) {

@@ -12,6 +12,7 @@
 #include <string>
 #include <vector>
 
+#include "support/allocation_sweep.h"
 #include "support/corpus.h"
 #include "support/jpeg_fixtures.h"
 #include "support/memory_stream.h"
@@ -185,30 +186,6 @@ inline Bytes RawChunk(const Bytes& tiff) {
     const auto size = static_cast<std::ptrdiff_t>(TIFFGetStrileByteCount(tif, 0));
     TIFFClose(tif);
     return Bytes(tiff.begin() + offset, tiff.begin() + offset + size);
-}
-
-// The nth allocating call from now fails.
-inline void FailAllocation(int n) {
-    TestAllocator::Reset();
-    TestAllocator::FailNthCall(n);
-}
-
-// Runs `attempt(n)` for n = 1, 2, ...: it sets its job up, calls
-// FailAllocation(n), runs it and says whether it succeeded. No run leaves a
-// block behind, and the first run that meets no failure succeeds.
-template <typename Attempt>
-void FailEachAllocation(Attempt attempt) {
-    for (int n = 1;; ++n) {
-        SCOPED_TRACE(::testing::Message() << "allocation " << n << " fails");
-        const bool succeeded = attempt(n);
-        const int calls = TestAllocator::Calls();
-        TestAllocator::Reset();
-        EXPECT_EQ(TestAllocator::LiveBlocks(), 0u);
-        if (calls < n) {
-            EXPECT_TRUE(succeeded);
-            return;
-        }
-    }
 }
 
 }  // namespace zantest

@@ -13,6 +13,7 @@
 #include "osttiff/osttiff.h"
 #include "pivlo/pivlo.h"
 #include "support/allocation_sweep.h"
+#include "support/host_destination.h"
 #include "support/memory_stream.h"
 #include "support/test_host.h"
 #include "support/tiff_fixtures.h"
@@ -101,96 +102,6 @@ private:
     MemoryStream stream_;
 };
 
-enum class DestKind { FileReopened, FileAsIs, Callbacks, FixedBuffer, GrowingMemory };
-constexpr DestKind kDests[] = {DestKind::FileReopened, DestKind::FileAsIs, DestKind::Callbacks,
-                               DestKind::FixedBuffer, DestKind::GrowingMemory};
-const char* const kDestNames[] = {"FileReopened", "FileAsIs", "Callbacks", "FixedBuffer", "GrowingMemory"};
-
-// A destination of the chosen kind for a TestHost, and the bytes it holds
-// once the job has ended (which its destructor makes sure of). A file handed
-// in read-only must be reopened from its path; a fixed buffer is followed by
-// guard bytes.
-class DestinationFixture {
-public:
-    DestinationFixture(TestHost& host, DestKind kind, uint32_t fixedCapacity = 1 << 20)
-        : host_(host), kind_(kind), fixed_(fixedCapacity + kGuard, kGuardByte) {
-        switch (kind) {
-        case DestKind::FileReopened:
-        case DestKind::FileAsIs:
-            WriteFileBytes(file_.path(), {});
-            host->destKind = ZAN_DEST_FILE;
-            host->destPath = file_.c_str();
-            host->destFp = std::fopen(file_.c_str(), kind == DestKind::FileAsIs ? "w+b" : "rb");
-            if (kind == DestKind::FileAsIs) host->destFileFlags = ZAN_DEST_FILE_USE_AS_IS;
-            break;
-        case DestKind::Callbacks:
-            host->destKind = ZAN_DEST_CALLBACKS;
-            host->destWriteProc = MemoryStream::Write;
-            host->destSeekProc = MemoryStream::Seek;
-            host->destUserData = &stream_;
-            host->sourceReadProc = MemoryStream::Read;  // read-back of what was written
-            host->sourceUserData = &stream_;
-            break;
-        case DestKind::FixedBuffer:
-            host->destKind = ZAN_DEST_FIXED_BUFFER;
-            host->destMemory = fixed_.data();
-            host->destMemoryCapacity = fixedCapacity;
-            host->destSizeOut = &size_;
-            break;
-        case DestKind::GrowingMemory:
-            host->destKind = ZAN_DEST_MEMORY;
-            host->destMemory = &block_;
-            host->destSizeOut = &size_;
-            break;
-        }
-    }
-    ~DestinationFixture() {
-        host_.EndJob();
-        if (host_->destFp) std::fclose(host_->destFp);
-        host_->destFp = nullptr;
-        if (block_ != kUnset) TestAllocator::Free(block_);  // the handed-over image
-    }
-
-    // Puts `bytes` in the destination as a file already there.
-    void Preload(const Bytes& bytes) {
-        if (kind_ == DestKind::Callbacks) stream_.data = bytes;
-        else if (kind_ == DestKind::FixedBuffer) std::copy(bytes.begin(), bytes.end(), fixed_.begin());
-        else WriteFileBytes(file_.path(), bytes);
-    }
-    // The bytes written, after the job has ended.
-    Bytes Written() {
-        switch (kind_) {
-        case DestKind::Callbacks: return stream_.data;
-        case DestKind::FixedBuffer: return Bytes(fixed_.begin(), fixed_.begin() + size_);
-        case DestKind::GrowingMemory:
-            if (!block_ || block_ == kUnset) return {};
-            return Bytes(static_cast<uint8_t*>(block_), static_cast<uint8_t*>(block_) + size_);
-        default:
-            std::fflush(host_->destFp);
-            return ReadFileBytes(file_.path());
-        }
-    }
-    bool GuardIntact() const {
-        return std::all_of(fixed_.end() - kGuard, fixed_.end(), [](uint8_t b) { return b == kGuardByte; });
-    }
-    void* block() const { return block_; }
-    void Forget() { block_ = nullptr; }
-    uint32_t size() const { return size_; }
-
-private:
-    static constexpr size_t kGuard = 16;
-    static constexpr uint8_t kGuardByte = 0xAB;
-    inline static char unsetMark_ = 0;
-    inline static void* const kUnset = &unsetMark_;  // the open must overwrite it
-    TestHost& host_;
-    DestKind kind_;
-    TempFile file_;
-    MemoryStream stream_;
-    Bytes fixed_;
-    void* block_ = kUnset;
-    uint32_t size_ = 0xDEAD;
-};
-
 // An open object (or a page already described) counts as open: the same
 // object comes back, whatever the kind now says, without touching the
 // source. An unknown kind fails without a message, and a job left with
@@ -211,7 +122,7 @@ TEST(OpenTIFF, OpenJobIsNotOpenedAgainAndUnknownKindsFailQuietly) {
     EXPECT_TRUE(HandlerProbe::InForce());
     {
         TestHost writer;
-        DestinationFixture dest(writer, DestKind::GrowingMemory);
+        HostDestination dest(writer, DestKind::GrowingMemory);
         ASSERT_EQ(OpenTIFFForWriting(writer.ctx()), 1);
         TIFF* const written = writer->tiff;
         writer->destKind = 42;
@@ -296,7 +207,7 @@ TEST(WritingOpen, SecondPageGoesBehindTheFirstOrFailsWithoutReadBack) {
     for (const auto& [kind, append] : cases) {
         SCOPED_TRACE(std::string(kDestNames[static_cast<int>(kind)]) + (append ? " appending" : " no read-back"));
         TestHost host;
-        DestinationFixture dest(host, kind);
+        HostDestination dest(host, kind);
         if (append) {
             dest.Preload(MakePages(1));
             host->appendPages = 1;
@@ -349,7 +260,7 @@ TEST(WritingOpen, DestinationThatCannotBeOpenedIsRefusedWithItsReason) {
         SCOPED_TRACE(kDestNames[static_cast<int>(c.kind)]);
         HandlerProbe probe;
         TestHost host;
-        DestinationFixture dest(host, c.kind);
+        HostDestination dest(host, c.kind);
         c.spoil(host);
         EXPECT_EQ(OpenTIFFForWriting(host.ctx()), 0);
         EXPECT_EQ(host.Errors(), Texts{c.error});
@@ -367,7 +278,7 @@ TEST(FixedBuffer, WritingPastTheCapacityFailsWithoutOverflow) {
     for (const auto& [capacity, file] : {std::pair{200u, big}, std::pair{4u, FileLayout{}}}) {
         SCOPED_TRACE(capacity);
         TestHost host;
-        DestinationFixture dest(host, DestKind::FixedBuffer, capacity);
+        HostDestination dest(host, DestKind::FixedBuffer, capacity);
         if (OpenTIFFForWriting(host.ctx()) == 1) {
             EXPECT_FALSE(WritePages(host->tiff, file));
         } else {
@@ -387,7 +298,7 @@ TEST(Teardown, GrowingImageIsHandedOverOnceWithThePageInProgress) {
     for (bool pageInProgress : {false, true}) {
         SCOPED_TRACE(pageInProgress);
         TestHost host;
-        DestinationFixture dest(host, DestKind::GrowingMemory);
+        HostDestination dest(host, DestKind::GrowingMemory);
         ASSERT_EQ(OpenTIFFForWriting(host.ctx()), 1);
         const uint8_t row[8] = {1, 2, 3, 4, 5, 6, 7, 8};
         if (pageInProgress) {
@@ -501,7 +412,7 @@ TEST(WritingOpen, EveryDestinationHoldsTheSameFileWhateverAllocationFails) {
         SCOPED_TRACE(kDestNames[static_cast<int>(kind)]);
         const bool growing = kind == DestKind::GrowingMemory;
         SweepAllocationFailures([&](TestHost& host) {
-            DestinationFixture dest(host, kind);
+            HostDestination dest(host, kind);
             host->frameBufferSize = 1001;
             if (!OpenTIFFForWriting(host.ctx())) return false;
             if (kind == DestKind::FixedBuffer || growing) { EXPECT_EQ(dest.size(), 0u); }

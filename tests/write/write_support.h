@@ -8,6 +8,7 @@
 #include <string>
 #include <vector>
 
+#include "support/host_destination.h"
 #include "support/memory_stream.h"
 #include "support/test_host.h"
 #include "support/tiff_fixtures.h"
@@ -19,42 +20,8 @@ enum class Dest { File, Callbacks, FixedBuffer, Memory };
 
 class WriteJob {
 public:
-    explicit WriteJob(Dest dest = Dest::Memory, uint32_t fixedCapacity = 8 << 20) : dest_(dest) {
-        ConversionContext* ctx = host_.ctx();
-        switch (dest) {
-        case Dest::File:
-            WriteFileBytes(file_.path(), {});
-            ctx->destKind = ZAN_DEST_FILE;
-            ctx->destPath = file_.c_str();
-            ctx->destFp = std::fopen(file_.c_str(), "rb");
-            break;
-        case Dest::Callbacks:
-            ctx->destKind = ZAN_DEST_CALLBACKS;
-            ctx->destWriteProc = MemoryStream::Write;
-            ctx->destSeekProc = MemoryStream::Seek;
-            ctx->destUserData = &stream_;
-            ctx->sourceReadProc = MemoryStream::Read;
-            ctx->sourceUserData = &stream_;
-            break;
-        case Dest::FixedBuffer:
-            fixed_.assign(fixedCapacity, 0);
-            ctx->destKind = ZAN_DEST_FIXED_BUFFER;
-            ctx->destMemory = fixed_.data();
-            ctx->destMemoryCapacity = fixedCapacity;
-            ctx->destSizeOut = &size_;
-            break;
-        case Dest::Memory:
-            ctx->destKind = ZAN_DEST_MEMORY;
-            ctx->destMemory = &block_;
-            ctx->destSizeOut = &size_;
-            break;
-        }
-    }
-    ~WriteJob() {
-        host_.EndJob();
-        if (host_->destFp) std::fclose(host_->destFp);
-        TestAllocator::Free(block_);
-    }
+    explicit WriteJob(Dest dest = Dest::Memory, uint32_t fixedCapacity = 8 << 20)
+        : destination_(host_, KindOf(dest), fixedCapacity) {}
 
     // Describes the image of the scanline writer.
     void Describe(uint32_t colorSpace, uint32_t width, uint32_t height, uint32_t compression,
@@ -77,29 +44,26 @@ public:
     // Ends the job and gives the bytes the destination holds.
     Bytes Finish() {
         host_.EndJob();
-        if (host_->destFp) std::fflush(host_->destFp);
-        switch (dest_) {
-        case Dest::File: return ReadFileBytes(file_.path());
-        case Dest::Callbacks: return stream_.data;
-        case Dest::FixedBuffer: return Bytes(fixed_.begin(), fixed_.begin() + size_);
-        case Dest::Memory:
-            return block_ ? Bytes(static_cast<uint8_t*>(block_), static_cast<uint8_t*>(block_) + size_) : Bytes();
-        }
-        return {};
+        return destination_.Written();
     }
 
     TestHost& host() { return host_; }
     ConversionContext* operator->() { return host_.ctx(); }
-    uint32_t size() const { return size_; }
+    uint32_t size() const { return destination_.size(); }
 
 private:
-    Dest dest_;
+    static DestKind KindOf(Dest dest) {
+        switch (dest) {
+        case Dest::File: return DestKind::FileReopened;
+        case Dest::Callbacks: return DestKind::Callbacks;
+        case Dest::FixedBuffer: return DestKind::FixedBuffer;
+        case Dest::Memory: break;
+        }
+        return DestKind::GrowingMemory;
+    }
+
     TestHost host_;
-    TempFile file_;
-    MemoryStream stream_;
-    Bytes fixed_;
-    void* block_ = nullptr;
-    uint32_t size_ = 0;
+    HostDestination destination_;
 };
 
 // Rows of `height` lines of `rowBytes` deterministic bytes.

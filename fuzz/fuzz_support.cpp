@@ -11,6 +11,17 @@ namespace zanfuzz {
 namespace {
 
 void DropHostMessage(ConversionContext*, int, int, const char*) {}
+
+// The host's allocator grants no block above 256 MiB, as a host with a
+// memory budget would: a page that claims more (and whose data could hold
+// it) meets a refused allocation instead of running the fuzzer out of
+// memory. Blocks are the C heap's, so that handed-over images go with free.
+constexpr uint32_t kLargestBlock = 256u << 20;
+void* BudgetAlloc(uint32_t size) { return size > kLargestBlock ? nullptr : std::malloc(size ? size : 1); }
+void* BudgetRealloc(void* block, uint32_t size) {
+    return size > kLargestBlock ? nullptr : std::realloc(block, size ? size : 1);
+}
+void BudgetFree(void* block) { std::free(block); }
 void DropCodecMessage(int, const char*) {}
 
 int32_t ReadInput(void* buffer, int32_t n, void* user) {
@@ -38,6 +49,9 @@ uint32_t SeekInput(uint32_t offset, int whence, void* user) {
 
 void InitQuietJob(ConversionContext* ctx) {
     pivloInitContext(ctx);
+    ctx->allocProc = BudgetAlloc;
+    ctx->reallocProc = BudgetRealloc;
+    ctx->freeProc = BudgetFree;
     ctx->hostMessageProc = DropHostMessage;
     ctx->errorProc = DropCodecMessage;
     ctx->warningProc = DropCodecMessage;

@@ -19,7 +19,8 @@ struct InputStream {
     uint32_t chunk;  // largest piece one read delivers (0: no limit)
 };
 
-// A job record with the C-heap allocators and every message dropped.
+// A job record with C-heap allocators that grant no block above 256 MiB,
+// and every message dropped.
 void InitQuietJob(ConversionContext* ctx);
 
 // Points the job's source at `input` as kind `selector % 4`: memory, file-like

@@ -20,8 +20,11 @@ for target in "$build"/bin/fuzz_*; do
     status=1
   fi
   echo "fuzz-smoke: $name for ${seconds}s"
+  # An input that fails is kept in fuzz-findings/ (ignored by git), to be
+  # fixed and then added to fuzz/regressions/.
+  mkdir -p "$here/fuzz-findings"
   if ! "$target" "$work" "${seeds[@]}" -max_total_time="$seconds" -timeout=20 \
-       -rss_limit_mb=2048 -print_final_stats=1 >"$work.log" 2>&1; then
+       -rss_limit_mb=2048 -print_final_stats=1 -artifact_prefix="$here/fuzz-findings/$name-" >"$work.log" 2>&1; then
     tail -n 60 "$work.log"
     status=1
   else

@@ -112,7 +112,7 @@ private:
         ctx_->colorSpace = ZAN_COLORSPACE_RGB;
         if (page_.width == 0 || page_.height == 0) return Fail("Image dimension can not be zero.");
         // Nothing is sized from the page's claims before its data can hold them.
-        if (!PageDataCanHold(tif_, StoredImageBytes(tif_))) return Fail(kPageDataTooSmall);
+        if (!PageDataCanHold(ctx_, tif_, StoredImageBytes(tif_))) return Fail(kPageDataTooSmall);
         const bool convert = !ctx_->keepFileLayout && page_.photometric == PHOTOMETRIC_RGB && page_.bits == 1 &&
                              page_.planar == PLANARCONFIG_SEPARATE && ctx_->requestedFormat == kFormatPalette &&
                              ctx_->requestedBitsPerSample == 4 && ctx_->requestedPaletteBits == 8;

@@ -30,14 +30,29 @@ bool IsFax(uint16_t compression) {
            compression == COMPRESSION_CCITTFAX4 || compression == COMPRESSION_CCITTRLEW;
 }
 
-// Sum of the byte counts of every strip or tile (saturating).
-uint64_t StoredDataBytes(TIFF* tif) {
+// The source's size when it is known without reading the source through:
+// not for a stream read once (the stream buffer would fetch it whole) nor
+// for the stream decoder (its data are still arriving); 0 when unknown.
+uint64_t KnownSourceSize(const ConversionContext* ctx, TIFF* tif) {
+    if (ctx->streamDecoder || (ctx->sourceKind == ZAN_SOURCE_STREAM && !ctx->sourceSeekProc)) return 0;
+    const toff_t size = TIFFGetSizeProc(tif)(TIFFClientdata(tif));
+    return size >= std::numeric_limits<uint32_t>::max() ? 0 : size;
+}
+
+// Sum of the byte counts of every strip or tile (saturating), each no more
+// than the `sourceSize` bytes hold after its offset when that size is known.
+uint64_t StoredDataBytes(TIFF* tif, uint64_t sourceSize) {
     const uint32_t blocks = TIFFIsTiled(tif) ? TIFFNumberOfTiles(tif) : TIFFNumberOfStrips(tif);
     uint64_t total = 0;
     for (uint32_t i = 0; i < blocks; ++i) {
         int error = 0;
-        const uint64_t count = TIFFGetStrileByteCountWithErr(tif, i, &error);
+        uint64_t count = TIFFGetStrileByteCountWithErr(tif, i, &error);
         if (error) break;
+        if (sourceSize) {
+            const uint64_t offset = TIFFGetStrileOffsetWithErr(tif, i, &error);
+            if (error) break;
+            count = std::min(count, offset < sourceSize ? sourceSize - offset : 0);
+        }
         total = count > std::numeric_limits<uint64_t>::max() - total ? std::numeric_limits<uint64_t>::max()
                                                                      : total + count;
     }
@@ -59,10 +74,10 @@ uint64_t StoredImageBytes(TIFF* tif) {
     return bytes;
 }
 
-bool PageDataCanHold(TIFF* tif, uint64_t storedBytes) {
+bool PageDataCanHold(const ConversionContext* ctx, TIFF* tif, uint64_t storedBytes) {
     uint16_t compression = COMPRESSION_NONE;
     TIFFGetFieldDefaulted(tif, TIFFTAG_COMPRESSION, &compression);
-    const uint64_t data = StoredDataBytes(tif);
+    const uint64_t data = StoredDataBytes(tif, KnownSourceSize(ctx, tif));
     if (IsFax(compression)) {
         // A fax row takes at least one bit, and a blank row of any width
         // only a few: such pages get a bound of their own.

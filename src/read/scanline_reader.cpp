@@ -249,7 +249,7 @@ uint32_t SetUpPage(ConversionContext* ctx) {
     const uint64_t width = ctx->imageWidth;
     // Nothing is sized from the page's claims before its data is known to
     // be able to hold them.
-    if (!PageDataCanHold(tif, StoredImageBytes(tif))) return fail(kPageDataTooSmall);
+    if (!PageDataCanHold(ctx, tif, StoredImageBytes(tif))) return fail(kPageDataTooSmall);
 
     // Extra samples: those the directory lists, or the surplus over the
     // colour channels of a page without the tag (the first taken as

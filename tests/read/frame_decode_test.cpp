@@ -166,6 +166,8 @@ TEST(FrameDecode, RefusalsTheirMessagesAndWhatIsLeft) {
         {"no such page", grey, 3, 0, 0, "Unable to access the page."},
         {"8 bits to 16", grey, 0, 16, 0, "Compressing from 1, 4, 8 to 16 bits image is not supported."},
         {"4 GiB of RGBA", HugePage(65536, 16384, 1, 8, 1100000), 0, 0, 0, "Buffer size too big"},
+        {"byte counts made up from the image size", UncountedPage(0x80000008u, 8), 0, 0, 0,
+         "The page's data is too small for the image it describes."},
         {"a page being written", grey, 0, 0, ZAN_STATE_WRITING, "Can not read while writing."},
     };
     for (const Case& c : cases) {

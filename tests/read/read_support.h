@@ -123,6 +123,19 @@ inline Bytes HugePage(uint32_t width, uint32_t height, uint16_t samples, uint16_
     return BuildTiff({page});
 }
 
+// An uncompressed grey page of `width` x `height` in one strip of 64 bytes
+// at offset 8, without StripByteCounts: libtiff makes the strip's byte count
+// up from the image's size.
+inline Bytes UncountedPage(uint32_t width, uint32_t height) {
+    BuiltPage page;
+    page.entries = {LongEntry(256, {width}), LongEntry(257, {height}), ShortEntry(258, {8}),
+                    ShortEntry(259, {COMPRESSION_NONE}), ShortEntry(262, {PHOTOMETRIC_MINISBLACK}),
+                    LongEntry(273, {8}), ShortEntry(277, {1}), LongEntry(278, {height})};
+    page.strips = {Bytes(64, 0x55)};
+    page.stripTags = false;
+    return BuildTiff({page});
+}
+
 // Row y of a fixture page as the reader delivers it: 1-bit rows packed,
 // narrower samples widened to bytes (2 bits times 85, 4 bits times 17),
 // 16-bit ones whole in host order when 16 bits are asked for and else by

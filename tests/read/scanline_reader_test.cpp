@@ -221,6 +221,8 @@ TEST(ScanlineReaderStates, PagesItCannotTakeAreRefusedWithTheirMessages) {
         // A tiny file that claims 4 GiB of pixels, and one whose line of
         // two 4-bit samples a pixel widens to more than 4 GiB.
         {HugePage(65535, 65535, 1, 8, 64), 0, false, "The page's data is too small for the image it describes."},
+        // A small file whose byte counts libtiff makes up from the image size.
+        {UncountedPage(65535, 65535), 0, false, "The page's data is too small for the image it describes."},
         {HugePage(0x80000001u, 1, 2, 4, 2100000), 0, false, "A line of the page is larger than 4 GiB."},
         {YCbCrPage(0x14, false), 0, true, "Unable to convert the page's YCbCr samples to RGB."},
     };

@@ -2,12 +2,11 @@
 
 #include <algorithm>
 
+#include "frame/tiff_structure.h"
+
 namespace zan {
 namespace {
 
-constexpr uint16_t kStripOffsets = 273, kStripByteCounts = 279;
-constexpr uint16_t kTileOffsets = 324, kTileByteCounts = 325;
-constexpr uint16_t kSubIfds = 330, kExifIfd = 34665, kGpsIfd = 34853, kInteropIfd = 40965;
 // Directories a walk visits at most, sub-directories included: far beyond
 // any real file, and a bound on the work a hostile one can cause.
 constexpr uint32_t kMostDirectories = 1u << 16;
@@ -71,14 +70,8 @@ public:
     }
 
 private:
-    static uint64_t TypeSize(uint32_t type) {
-        switch (type) {
-        case 3: case 8: return 2;
-        case 4: case 9: case 11: case 13: return 4;
-        case 5: case 10: case 12: return 8;
-        default: return 1;
-        }
-    }
+    // Unknown types count as one byte a value.
+    static uint64_t TypeSize(uint32_t type) { return std::max<uint32_t>(1, TiffTypeSize(static_cast<uint16_t>(type))); }
 
     uint32_t Number(uint64_t at, uint32_t type, uint32_t index) const {
         return type == 3 ? Get16(at + 2ull * index) : Get32(at + 4ull * index);
@@ -105,18 +98,10 @@ bool FindTiffExtent(const uint8_t* data, uint32_t size, uint32_t* extent) {
     if (!data || size < 8 || (data[0] != 'I' && data[0] != 'M') || data[1] != data[0]) return false;
     ExtentWalk walk(data, size, data[0] == 'M');
     if (walk.Get16(2) != 42) return false;
-    // Brent's cycle detection over the chain of pages.
-    uint32_t tortoise = walk.Get32(4), power = 1, steps = 0;
-    for (uint32_t ifd = tortoise; ifd != 0;) {
-        uint32_t next = 0;
-        if (!walk.Directory(ifd, 0, &next) || next == tortoise) return false;
-        if (++steps == power) {
-            tortoise = next;
-            power *= 2;
-            steps = 0;
-        }
-        ifd = next;
-    }
+    const ChainEnd end = FollowChain(walk.Get32(4), [&](uint32_t ifd, uint32_t* next) {
+        return walk.Directory(ifd, 0, next);
+    });
+    if (end != ChainEnd::End) return false;
     *extent = static_cast<uint32_t>(walk.end());
     return true;
 }

@@ -133,12 +133,8 @@ private:
     uint64_t position_ = kUnknown;
 };
 
-constexpr uint16_t kStripOffsets = 273, kTileOffsets = 324;
-constexpr uint16_t kStripByteCounts = 279, kTileByteCounts = 325;
 constexpr uint16_t kNewSubfileType = 254, kPageNumber = 297;
 constexpr uint16_t kBitsPerSample = 258, kCompression = 259;
-constexpr uint16_t kExifIfd = 34665, kGpsIfd = 34853, kInteropIfd = 40965;
-constexpr uint16_t kSubIfds = 330;
 constexpr uint16_t kJpegInterchange = 513, kJpegInterchangeLength = 514;
 constexpr uint16_t kJpegQTables = 519, kJpegDcTables = 520, kJpegAcTables = 521;
 constexpr uint16_t kShort = 3, kLong = 4, kDouble = 12, kIfd = 13;
@@ -166,16 +162,6 @@ constexpr char kUnmovableTables[] =
 
 uint64_t Even(uint64_t position) { return position + (position & 1); }
 
-// Size in bytes of one value of a field type; 0 for unknown types.
-uint32_t TypeSize(uint16_t type) {
-    switch (type) {
-    case 1: case 2: case 6: case 7: return 1;
-    case 3: case 8: return 2;
-    case 4: case 9: case 11: case 13: return 4;
-    case 5: case 10: case 12: return 8;
-    default: return 0;
-    }
-}
 
 // Width of the numbers a type's values are converted by: 2 or 4 bytes (a
 // RATIONAL is two 4-byte numbers); 0 for bytes, which need no conversion.
@@ -276,7 +262,7 @@ private:
         e.tag = in_.Get16(e.raw);
         e.type = in_.Get16(e.raw + 2);
         e.count = in_.Get32(e.raw + 4);
-        e.byteSize = uint64_t{e.count} * TypeSize(e.type);
+        e.byteSize = uint64_t{e.count} * TiffTypeSize(e.type);
         e.value = in_.Get32(e.raw + 8);
         return e;
     }
@@ -403,7 +389,7 @@ private:
     // pointers it relocates, or anywhere when asked to (extraction copies
     // other IFD fields as the numbers they are).
     bool TypeAccepted(DirKind kind, const Entry& e) const {
-        if (TypeSize(e.type) == 0) return false;
+        if (TiffTypeSize(e.type) == 0) return false;
         DirKind sub;
         return e.type != kIfd || options_.acceptIfdType || SubDirectoryOf(kind, e, &sub);
     }

@@ -6,6 +6,7 @@
 #include <cstdint>
 #include <cstdio>
 
+#include "frame/tiff_structure.h"
 #include "zantiff/conversion_context.h"
 
 namespace zan {
@@ -52,22 +53,16 @@ enum class ChainResult { End, Stopped, Loop, Damaged };
 template <typename Visit>
 ChainResult WalkChain(ConversionContext* ctx, FILE* stream, ByteOrder order, uint64_t fileSize,
                       uint32_t first, Visit visit) {
-    uint32_t tortoise = first;
-    uint64_t power = 1, steps = 0;
-    for (uint32_t current = first; current != 0;) {
-        uint32_t next = 0, nextField = 0;
-        if (!skipIfd(ctx, stream, current, order, fileSize, &next, &nextField))
-            return ChainResult::Damaged;
-        if (!visit(current, nextField)) return ChainResult::Stopped;
-        if (next == tortoise) return ChainResult::Loop;
-        if (++steps == power) {
-            tortoise = next;
-            power *= 2;
-            steps = 0;
+    ChainResult stopped = ChainResult::Stopped;
+    const ChainEnd end = FollowChain(first, [&](uint32_t current, uint32_t* next) {
+        uint32_t nextField = 0;
+        if (!skipIfd(ctx, stream, current, order, fileSize, next, &nextField)) {
+            stopped = ChainResult::Damaged;
+            return false;
         }
-        current = next;
-    }
-    return ChainResult::End;
+        return visit(current, nextField);
+    });
+    return end == ChainEnd::End ? ChainResult::End : end == ChainEnd::Loop ? ChainResult::Loop : stopped;
 }
 
 struct PageCopyOptions {

@@ -15,6 +15,7 @@
 #include "support/allocation_sweep.h"
 #include "support/host_destination.h"
 #include "support/memory_stream.h"
+#include "support/tiff_builder.h"
 #include "support/test_host.h"
 #include "support/tiff_fixtures.h"
 #include "zantiff/zantiff.h"
@@ -248,6 +249,15 @@ TEST(WritingOpen, DestinationThatCannotBeOpenedIsRefusedWithItsReason) {
          [](TestHost& host) { host->destSeekProc = nullptr; }},
         {DestKind::FixedBuffer, "The destination buffer holds no TIFF to add a page to.",
          [](TestHost& host) { host->appendPages = 1; }},
+        {DestKind::FixedBuffer, "The destination buffer holds no TIFF to add a page to.",
+         [](TestHost& host) {
+             // A file whose only directory names itself as the next one.
+             Bytes looping = MakeTiff(FileLayout{});
+             const uint32_t ifd = DirectoryOffsets(looping)[0];
+             Put32(looping, ifd + 2 + 12 * Get16(looping, ifd), ifd);
+             std::copy(looping.begin(), looping.end(), static_cast<uint8_t*>(host->destMemory));
+             host->appendPages = 1;
+         }},
         {DestKind::FileAsIs, "Memory allocation", [](TestHost&) { TestAllocator::FailNthCall(1); }},
         {DestKind::GrowingMemory, "Memory allocation", [](TestHost&) { TestAllocator::FailNthCall(1); }},
         {DestKind::GrowingMemory, "Unable to create TIFF object",
